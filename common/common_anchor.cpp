@@ -1,0 +1,1 @@
+// Anchor so korv_common is never an empty archive.

@@ -1,0 +1,1 @@
+// Anchor so this directory's library is never an empty archive.

@@ -1,0 +1,1 @@
+// Anchor until the client library lands.

@@ -1,0 +1,17 @@
+// Capturing what a piece of code writes to standard output.
+#pragma once
+
+#include <functional>
+#include <string>
+
+namespace korv_test {
+
+// Runs fn with the process's standard output (fd 1 and stdout) redirected to
+// a temporary file and returns everything written.
+std::string capture_stdout(const std::function<void()> &fn);
+
+// Runs fn in a forked child and returns its exit status (or 128+signal).
+// Use it for code that reads process-wide state once (the system root).
+int run_in_child(const std::function<int()> &fn);
+
+}  // namespace korv_test
