@@ -41,7 +41,11 @@ int iscsi_ip_cmp_ip(const iscsi_ip_t *a, const iscsi_ip_t *b);
 
 /* Appends the portal addresses of the links that are up; never clears the list. */
 int sys_net_get_ip_list(list_t *list);
-/* Lower-cases A-Z and turns '_' into '-' in place. 0, or -1 on NULL. */
+/* Lower-cases A-Z and turns '_' into '-' in place, logging the text before
+ * and after at log_level (the daemon's node list logs at 1, the host-name
+ * conversion at 2). 0, or -1 on NULL. */
+int conv_iqn_str(char *text, int log_level);
+/* conv_iqn_str at level 2. */
 int conv_hostname_to_iqn_str(char *text);
 int sys_net_get_host_name(char *out, size_t size, int refresh);
 int sys_net_get_host_name_in_iqn_spec(char *out, size_t size, int refresh);

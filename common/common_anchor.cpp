@@ -1,1 +1,0 @@
-// Anchor so korv_common is never an empty archive.
