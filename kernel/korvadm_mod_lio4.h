@@ -1,0 +1,161 @@
+/* The LIO back end of the kernel target driver: configfs primitives, the
+ * three kernel modules, and the target-side operations.
+ *
+ * configfs tree driven here (all under the system root):
+ *
+ *   /sys/kernel/config/target/
+ *     iscsi/<iqn>/tpgt_<n>/        T, the portal group of a target
+ *       enable, attrib/*, param/*    switches and parameters
+ *       np/<addr>:<port>             network portals ("[v6]:port", "[v6%if]:port")
+ *       acls/<initiator>/            per-initiator auth/, attrib/, lun_<m>/
+ *       lun/lun_<m>/<lun name>       link to the backstore
+ *     core/fileio_<hba>/<lun name>/  backstores
+ *   /var/target/{pr,alua}            kernel state directories
+ *
+ * Attributes are written through the shell (values and paths escaped, never
+ * run) and read with stdio; "verified" writes read the value back. Callers
+ * serialise driver operations. Every function returns 0 or a negative code of
+ * common/korvadm_err.h. Paths taken as arguments are already mapped through
+ * the system root; the fixed paths of this file are mapped inside. */
+#ifndef KORVADM_MOD_LIO4_H
+#define KORVADM_MOD_LIO4_H
+
+#include <stddef.h>
+
+#include "kernel/korvadm_mod.h"
+
+#ifdef __cplusplus
+extern "C" {
+#endif
+
+#define IP_TYPE_V4 1
+#define IP_TYPE_V6 2
+
+/* The LIO table (type 2): slots 0..10 and 13 filled, the rest empty. */
+extern const iscsi_mod_ops_t lio3_mod_ops;
+
+/* ---- configfs primitives ---- */
+
+/* Creates path and missing parents (0700). -9989 for NULL; a failed mkdir is
+ * logged but still answers 0: callers that must know check the path. */
+int configfs_mkdir(const char *path);
+/* rmdir of one empty directory. -9989 NULL; -9988 failure. */
+int configfs_rmdir(const char *path);
+/* Removes a tree ("rm -rf"). -9989 NULL; -9988 failure. */
+int configfs_rmdir_recursive(const char *path);
+/* 0 when path exists, else -1. */
+int configfs_path_exist(const char *path);
+/* -1 when nothing is mounted at the configfs mount point, else whether it
+ * exists (0 / -1). */
+int configfs_is_mounted(void);
+/* "mount -t configfs configfs <mount point>". 0 / -9988. */
+int configfs_mount(void);
+/* Reads the attribute into buf (size bytes; the text is cut to size-1 and
+ * always terminated) and strips one line end found among its last ten
+ * characters (never the first character). -9989 for NULL or size 0; -9973
+ * when it cannot be opened. */
+int configfs_read_attr_str(const char *path, char *buf, size_t size);
+/* Raw read: up to size bytes into buf, count in *out_len, no termination.
+ * -9989 / -9973 as above. */
+int configfs_read_attr_buf(const char *path, char *buf, size_t size, size_t *out_len);
+/* Reads a decimal attribute. -9971 when it is empty; a text that is not a
+ * number answers 0 and leaves *out unchanged. */
+int configfs_read_attr_int(const char *path, int *out);
+/* Writes value exactly (retrying once with a line end when the kernel refuses
+ * it without). With verify, reads it back: -9972 when it differs, -9973 when
+ * it cannot be read. -9989 NULL; -9973 both writes failed; -9987 no memory. */
+int configfs_write_attr_str(const char *path, const char *value, int verify);
+/* configfs_write_attr_str of "%d". */
+int configfs_write_attr_int(const char *path, int value, int verify);
+
+/* ---- kernel modules ---- */
+
+/* "insmod <mod_path>". -9989 NULL; -9988 when the command fails. */
+int _insert_mod(const char *mod_path);
+/* "rmmod <name>"; with check_inserted 1 an absent module answers 0 at once.
+ * -9989 NULL; -9988 when the command fails. */
+int _remove_mod(const char *mod_proc_name, int check_inserted);
+/* Last resort: rm -rf the iscsi and core trees, rmmod all three modules.
+ * -9988 when the last rmmod fails. No operation calls it. */
+int _brute_force_remove_mod(void);
+/* Runs cmd up to max_retry+1 times (see process_system_cmd_mt). */
+int _process_system_cmd_mt(const char *cmd, int max_retry, int max_sleep_us);
+
+/* Slot 0: mounts configfs if needed, inserts the modules, creates the iSCSI
+ * fabric directory and /var/target/{pr,alua}. Judged by /proc/modules; on a
+ * failure from target_core_file onwards all three modules are removed and
+ * -9976 returned. */
+int lio3_start_module(void);
+/* Slot 1: from running, removes every target, the fabric directory and every
+ * backstore, then the modules; from half started, only the modules. 0, or
+ * -9975 when iscsi_target_mod or target_core_file cannot be removed. */
+int lio3_stop_module(void);
+/* Slot 2: 1 stopped, 0 running, -9974 module in but fabric directory missing. */
+int lio3_get_module_state(void);
+
+/* ---- targets (slots 3..10) ----
+ * Each checks the target first: NULL, empty IQN (or one that is not a single
+ * path component) or tpgt outside 0..63 answer -9989. */
+
+/* Creates the portal group with its default attributes; an existing one is
+ * left untouched (0). -9973 when the group cannot be created. */
+int lio3_add_target(iscsi_target_t *target);
+/* Disables, removes portals, ACLs and LUNs, then the group and the IQN
+ * directory. An absent target answers 0; any failed step -9973. */
+int lio3_del_target(iscsi_target_t *target);
+/* An unreadable enable switch counts as enabled. -9973 on failure. */
+int lio3_enable_target(iscsi_target_t *target);
+int lio3_disable_target(iscsi_target_t *target);
+/* Sets the authentication switch from target->chap and, with CHAP on, pushes
+ * the credentials to every ACL. -9989 for invalid CHAP settings. */
+int lio3_set_target_chap(iscsi_target_t *target);
+/* Replaces every portal with the wanted ones (IPv4 first, then IPv6);
+ * creation failures are logged only. */
+int lio3_set_target_ip(iscsi_target_t *target);
+/* Creates the wanted portals whose address is missing and removes those no
+ * longer wanted, by address (ports are not compared). */
+int lio3_set_target_ip_v2(iscsi_target_t *target);
+/* Writes timeout to every ACL's attrib/dataout_timeout. -9968 when the
+ * target is not in the kernel; -9973 when its ACLs cannot be listed. */
+int lio3_set_target_attr_dataout_timeout(int timeout, iscsi_target_t *target);
+/* Appends the target's portals to ip_list, in directory order; names that
+ * do not parse are dropped. -9973 when the np directory cannot be read. */
+int lio3_get_target_existing_ip_list(list_t *ip_list, iscsi_target_t *target);
+
+/* 1 when the CHAP settings are usable: CHAP off, or name and a 12..16
+ * character password (and the same for mutual CHAP when it is on); else 0. */
+int _lio3_validate_target_chap_settings(const iscsi_target_t *target);
+/* Pushes the target's CHAP (and mutual CHAP) credentials to one ACL. */
+int _lio3_set_target_chap_to_acl(const char *initiator_iqn, iscsi_target_t *target);
+
+/* IP_TYPE_V4 when name holds fewer than two ':', else IP_TYPE_V6. */
+int _check_np_ip_type(const char *name);
+/* Splits a portal directory name ("a.b.c.d:port", "[v6]:port",
+ * "[v6%if]:port") into its parts. The port text must be under 6 characters;
+ * address and interface must fit addr_size / if_size. -9989 on a malformed
+ * name, -9971 on "". iface is "" when the name has no '%'. */
+int _parse_lio_np_entry(char *addr, size_t addr_size, int *port, char *iface, size_t if_size,
+                        const char *name);
+
+/* ---- teardown (used by deletion and stop) ---- */
+
+/* Slot 13: removes the LUN's fileio backstore (and its ALUA state). An
+ * absent one answers 0; -9989 on bad LUN fields or failure. */
+int lio3_shutdown_backstore(iscsi_lun_t *lun);
+int _lio3_remove_fileio_device(iscsi_lun_t *lun);
+/* Remove every ACL / LUN directory of the portal group; -9989 when the
+ * group's acls/ or lun/ directory cannot be opened. */
+int _lio3_remove_all_acl(iscsi_target_t *target);
+int _lio3_remove_all_lun(iscsi_target_t *target);
+/* Deletes every portal group (tpgt_<n>) of target->iqn. */
+int _lio3_remove_all_tpgt(iscsi_target_t *target);
+/* Deletes every target of the iSCSI fabric. -9973 on the first failure. */
+int _lio3_remove_all_iscsi_target(void);
+/* Shuts down every fileio backstore and removes every HBA directory. */
+int _lio3_shutdown_all_hba(void);
+
+#ifdef __cplusplus
+}
+#endif
+
+#endif
