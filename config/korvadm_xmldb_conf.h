@@ -1,0 +1,156 @@
+/* The configuration store on the configuration database: the numbered-entry
+ * scanner and counters the schema's lists rest on, the target schema, the
+ * service settings, and the table iscsi_conf_ops that exposes them.
+ *
+ * Lists are numbered children "<root>/id:N/<field>" from 1, dense: a reader
+ * stops at the first N whose key is empty, so entry N is visible only when
+ * 1..N-1 all hold a key. Results: 0 success, -9989 parameter error, -9981
+ * failure (also the generic one), -9980 not found, -9979 no room, -9990 /
+ * -9992 passed up from the typed wrappers (config/korvadm_utils.h).
+ *
+ * Values under "/system_mgr" go through the platform's db* shortcuts, whose
+ * results are ignored: they cannot fail here. Everything else goes through
+ * the typed wrappers, whose failures are reported. */
+#ifndef CONFIG_KORVADM_XMLDB_CONF_H
+#define CONFIG_KORVADM_XMLDB_CONF_H
+
+#include <stddef.h>
+#include <stdint.h>
+
+#include "config/korvadm_conf.h"
+
+#ifdef __cplusplus
+extern "C" {
+#endif
+
+/* The store's operations table; slots of later work are NULL. */
+extern const iscsi_conf_ops_t iscsi_conf_ops;
+
+/* ---- scanner and counters (shared by the schema's units) ---- */
+
+/* Entry number whose <key> equals value, scanning 1..max until the first
+ * empty or unreadable key. ID_ENTRY_FOUND (5) with *out_id = N, or
+ * ID_ENTRY_NOT_FOUND (6) with *out_id = 0; -9989 for a NULL argument. */
+int _search_xmldb_id_entry(int *out_id, const char *root, int max, const char *key, const char *value);
+/* First number 1..max whose key is empty or unreadable: 5 with *out_id = N;
+ * 6 with *out_id = 0 when all max are taken; -9989 for a NULL argument. */
+int _get_free_xmldb_id_entry(int *out_id, const char *root, int max, const char *key);
+/* Number of consecutive entries from 1 (at most max) holding a key; -1 for a
+ * NULL argument. */
+int _cal_xmldb_id_entry_count(const char *root, int max, const char *key);
+
+/* Counter updates: read (failed or empty reads as 0), adjust (never below 0),
+ * write back. 0, or -9981 when the write fails. */
+int _xmldb_inc_target_count(void);
+int _xmldb_dec_target_count(void);
+int _xmldb_inc_lun_count(void);
+int _xmldb_dec_lun_count(void);
+int _xmldb_inc_acl_count(void);
+int _xmldb_dec_acl_count(void);
+int _xmldb_inc_target_lun_map_cnt(int target_id);
+int _xmldb_dec_target_lun_map_cnt(int target_id);
+/* Recounts the ACL initiators (1..129) into "/iscsi/acl/count". 0 / -9981. */
+int _xmldb_update_current_aclcnt(void);
+int xmldb_update_current_aclcnt(void);
+
+/* Entry number of the named target (>= 1), -9989 when it is not found or the
+ * name is NULL, -9981 on a scan failure. */
+int _xmldb_get_target_dbidx_by_name(const char *name);
+
+/* ---- targets: at most 64 under "/iscsi/target", keyed by "name" ---- */
+
+/* Validates conf (name, iqn, tpgt >= 0, chap_enable 0/1, hba_id >= 0, CHAP
+ * name and secret when CHAP is on; -9989 before any write), takes the free
+ * entry (-9979 when 64 exist), sets conf->dbidx, writes the fields and bumps
+ * the count. A failed write gives -9981 and leaves what was written. */
+int xmldb_add_new_target(target_conf_t *conf);
+/* Deletes the entry and its subtree; later entries are not renumbered. */
+int xmldb_del_target_by_name(const char *name);
+/* 1 when a target of that name exists, else 0; -9989 for NULL/"". */
+int xmldb_check_target_exist(const char *name);
+/* 1 when the name exists, -9979 when 64 others exist, 0 when it can be added. */
+int xmldb_check_add_target(const char *name);
+int xmldb_get_target_state(int *state, const char *name);
+int xmldb_set_target_state(int state, const char *name);
+int xmldb_get_target_tpgt(int *tpgt, const char *name);
+int xmldb_get_target_hba_id(int *hba_id, const char *name);
+int xmldb_set_target_hba_id(int hba_id, const char *name);
+/* Lowest back-end number 0..63 no target uses; -9979 (*hba_id = -1) if none. */
+int xmldb_get_free_target_hba_id(int *hba_id);
+/* size must be at least CONF_IQN_LEN. */
+int xmldb_get_target_iqn(char *buf, size_t size, const char *name);
+int xmldb_set_target_iqn(const char *iqn, const char *name);
+/* chap_enable 0 clears the name and secret; anything but 0/1 is -9989. */
+int xmldb_set_target_chap(int chap_enable, const char *chap_name, const char *chap_pwd, const char *name);
+/* Recounts targets and running targets over 1..64 (gaps included) and removes
+ * ghost entries (a status without a name) at count + 1. */
+int xmldb_update_current_targetcnt(void);
+/* size must be at least CONF_NAME_LEN. */
+int xmldb_get_target_status(char *buf, size_t size, const char *name);
+int xmldb_set_target_status(const char *status, const char *name);
+/* Fills conf (a record from target_conf_new) with every field of the target. */
+int xmldb_get_target_conf_by_name(target_conf_t *conf, const char *name);
+/* Appends one record per target (1..64, up to the first empty name) with name
+ * and tpgt only. Fails as a whole (records appended by this call are freed)
+ * with -9992 when the database cannot be read, -9990 for an unreadable tpgt,
+ * -9987 with no memory. */
+int xmldb_get_all_target_conf_lite(list_t *list);
+/* As the lite form, every field filled; CHAP name and secret only when CHAP is on. */
+int xmldb_get_all_target_conf(list_t *list);
+/* Deletes "/iscsi/target"; always 0. */
+int xmldb_clean_target_conf(void);
+/* 0 when the target's "conn_info" was deleted, 6 when there is no such target. */
+int xmldb_del_target_conn_info(const char *name);
+/* Writes connection conn's ip and iqn: 0, -9981 on a failed write, 6 when
+ * there is no such target. */
+int xmldb_set_target_conn_info(const char *name, int conn, const char *ip, const char *iqn);
+
+/* ---- service settings ---- */
+
+int xmldb_get_service_enable(int *enable);
+int xmldb_set_service_enable(int enable);
+/* Settings-layout version; with none stored: 1 when "/iscsi/acl/count" holds
+ * a value (the first layout), 0 on a fresh store. -9981 on a failed read. */
+int xmldb_get_korvadm_ver(int *ver);
+int xmldb_set_korvadm_ver(int ver);
+int xmldb_get_service_progress(int *progress);
+int xmldb_set_service_progress(int progress);
+/* size must be at least 128; "" means none saved. */
+int xmldb_get_saved_host_name(char *buf, size_t size);
+int xmldb_set_saved_host_name(const char *host_name);
+/* size must be at least CONF_GEN_IQN_LEN; "" when unset. */
+int xmldb_get_iqn_prefix(char *buf, size_t size);
+int xmldb_set_iqn_prefix(const char *prefix);
+/* dev_name "bond0"/"egiga0" is the first port's slot, "egiga1" the second's;
+ * any other -9980. Readers: buf holds 16 (IPv4) / 40 (IPv6) bytes; -9980
+ * when nothing is saved. */
+int xmldb_get_saved_ipv4_addr(char *buf, const char *dev_name);
+int xmldb_set_saved_ipv4_addr(const char *addr, const char *dev_name);
+int xmldb_get_saved_ipv6_addr(char *buf, const char *dev_name);
+int xmldb_set_saved_ipv6_addr(const char *addr, const char *dev_name);
+/* Empties both saved IPv4 addresses; the IPv6 ones stay. */
+int xmldb_clean_saved_ip_addr(void);
+/* *level = 0 and the wrapper's code on a failed or empty read. */
+int xmldb_get_debug_level(int *level);
+int xmldb_set_debug_level(int level);
+int xmldb_get_nesrad_pid(int *pid);
+/* pid 0 means no daemon runs; a negative pid is -9989. */
+int xmldb_set_nesrad_pid(int pid);
+int xmldb_get_nesrad_enable(int *enable);
+int xmldb_set_nesrad_enable(int enable);
+int xmldb_get_nesrad_ip(char *buf, size_t size);
+int xmldb_set_nesrad_ip(const char *ip);
+int xmldb_clean_nesrad_conf(void);
+/* Deletes "/iscsi/sess/initiator"; always 0. */
+int xmldb_clean_sess_conf(void);
+int xmldb_save_conf(void);
+/* Removes the iSNS settings and the target, LUN, ACL and session subtrees;
+ * always 0. */
+int xmldb_clean_conf(void);
+int xmldb_set_temp_return_code(int code);
+
+#ifdef __cplusplus
+}
+#endif
+
+#endif
