@@ -1,0 +1,236 @@
+/* iSNS operations: the node and portal records, registration, deregistration
+ * and the registration check. */
+#include "isns/isns_client.h"
+
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <string_view>
+
+#include "common/korvadm_err.h"
+#include "common/korvadm_log.h"
+#include "isns/isns_pdu.h"
+#include "isns/isns_transport.h"
+
+char isns_entity_id[128];
+char isns_entity_name[256];
+
+namespace {
+
+/* Registration options: bit 0 sends the portal lists; the whole word goes out
+ * as the iSCSI Node Type, so it must stay 1 (Target). */
+int g_reg_options = 0;
+
+uint32_t be32(const unsigned char *p)
+{
+    return (static_cast<uint32_t>(p[0]) << 24) | (static_cast<uint32_t>(p[1]) << 16) |
+           (static_cast<uint32_t>(p[2]) << 8) | p[3];
+}
+
+/* One attribute of a received payload; value lies within the payload. */
+struct attr {
+    uint32_t tag;
+    uint32_t len;
+    const unsigned char *value;
+};
+
+/* Walks the attributes of payload[from, size). Returns false, having visited
+ * only whole attributes, when one is cut short or has a length that is not a
+ * multiple of 4. */
+template <class Fn>
+bool walk_attrs(const unsigned char *payload, size_t from, size_t size, Fn fn)
+{
+    size_t p = from;
+    while (p < size) {
+        if (size - p < 8)
+            return false;
+        const attr a{be32(payload + p), be32(payload + p + 4), payload + p + 8};
+        if (a.len % 4 != 0 || a.len > size - p - 8)
+            return false;
+        if (!fn(a))
+            return true;
+        p += 8 + a.len;
+    }
+    return true;
+}
+
+/* Items shared by both registrations up to the key's delimiter. */
+void emit_reg_head(void)
+{
+    emit_hdr(ISNS_DEV_ATTR_REG);
+    emit_attr(ISNS_TAG_ISCSI_NAME, isns_entity_name);
+    emit_attr(ISNS_TAG_ENTITY_ID, isns_entity_id);
+    emit_delimiter();
+    emit_attr(ISNS_TAG_ENTITY_ID, isns_entity_id);
+}
+
+/* The node, its type (and alias) and its portal groups. */
+void emit_reg_node(const isns_iscsi_node *node)
+{
+    emit_attr(ISNS_TAG_ISCSI_NAME, node->name);
+    emit_iscsi_node_type(g_reg_options);
+    if (isns_alias_on)
+        emit_attr(ISNS_TAG_ISCSI_ALIAS, isns_alias);
+    if (g_reg_options & 1)
+        emit_portals(node, 1);
+}
+
+}  // namespace
+
+isns_ip_portal *isns_ip_portal_new(void)
+{
+    auto *p = static_cast<isns_ip_portal *>(calloc(1, sizeof(isns_ip_portal)));
+    if (p)
+        list_node_init(&p->link, p);
+    return p;
+}
+
+isns_iscsi_node *isns_iscsi_node_new(void)
+{
+    auto *n = static_cast<isns_iscsi_node *>(calloc(1, sizeof(isns_iscsi_node)));
+    if (n) {
+        list_init(&n->portals);
+        list_node_init(&n->link, n);
+    }
+    return n;
+}
+
+void isns_ip_portal_free(isns_ip_portal *portal)
+{
+    if (!portal)
+        return;
+    list_remove(&portal->link);
+    free(portal);
+}
+
+void isns_iscsi_node_free(isns_iscsi_node *node)
+{
+    if (!node)
+        return;
+    list_release(&node->portals, [](void *p) { isns_ip_portal_free(static_cast<isns_ip_portal *>(p)); });
+    list_remove(&node->link);
+    free(node);
+}
+
+int isns_iscsi_node_add_portal(isns_iscsi_node *node, isns_ip_portal *portal)
+{
+    if (!node || !portal || portal->link.list) {
+        DBG(0, "ERR_PARAM_ERROR");
+        return ERR_PARAM;
+    }
+    list_append(&portal->link, &node->portals);
+    return 0;
+}
+
+int isns_iscsi_node_list_add(list_t *list, isns_iscsi_node *node)
+{
+    if (!list || !node || node->link.list) {
+        DBG(0, "ERR_PARAM_ERROR");
+        return ERR_PARAM;
+    }
+    list_append(&node->link, list);
+    return 0;
+}
+
+void isns_iscsi_node_list_release(list_t *list)
+{
+    list_release(list, [](void *n) { isns_iscsi_node_free(static_cast<isns_iscsi_node *>(n)); });
+}
+
+int register_entity(isns_iscsi_node *node)
+{
+    if (!node)
+        return -1;
+    g_reg_options = 1;
+    emit_reg_head();
+    emit_entity_protocol(ISNS_ENTITY_PROTOCOL_ISCSI);
+    if (g_reg_options & 1)
+        emit_portals(node, 0);
+    emit_reg_node(node);
+    const int r = send_and_recv();
+    return r < 0 ? r : 0;
+}
+
+int register_node(isns_iscsi_node *node)
+{
+    if (!node)
+        return -1;
+    g_reg_options = 1;
+    emit_reg_head();
+    emit_reg_node(node);
+    const int r = send_and_recv();
+    return r < 0 ? r : 0;
+}
+
+int deregister_entity(const char *name)
+{
+    if (isns_trace)
+        puts("deregister_entity()");
+    emit_hdr(ISNS_DEV_DEREG);
+    emit_attr(ISNS_TAG_ISCSI_NAME, name ? name : "");
+    emit_delimiter();
+    emit_attr(ISNS_TAG_ENTITY_ID, isns_entity_id);
+    return send_and_recv() < 0 ? -1 : 0;
+}
+
+int query_entity(const char *name)
+{
+    emit_hdr(ISNS_DEV_ATTR_QRY);
+    emit_attr(ISNS_TAG_ISCSI_NAME, isns_entity_name);
+    emit_attr(ISNS_TAG_ISCSI_NAME, name ? name : "");
+    emit_iscsi_node_type(ISNS_NODE_TYPE_TARGET);
+    emit_delimiter();
+    emit_attr(ISNS_TAG_ISCSI_NAME, nullptr);
+    const int r = send_and_recv();
+    if (r < 0)
+        return isns_last_status != 0 ? -2 : -1;
+    if (!walk_attrs(isns_pdu_buf, 4, static_cast<size_t>(r), [](const attr &) { return true; })) {
+        DBG(1, "malformed iSNS query response (%d bytes)", r);
+        return -1;
+    }
+    return r;
+}
+
+int isns_check_registration(const char *name)
+{
+    if (!name)
+        return -1;
+    const int r = query_entity(name);
+    if (r < 0) {
+        if (r == -2 && (isns_last_status == 6 || isns_last_status == 7))
+            return 0;
+        return -1;
+    }
+    if (((isns_rsp_hdr[2] << 8) | isns_rsp_hdr[3]) != ISNS_DEV_ATTR_QRY_RSP || r == 0)
+        return 0;
+
+    /* Attributes up to the first delimiter echo our key; the names the
+     * server holds follow it. */
+    const std::string_view want(name);
+    bool after_delim = false;
+    bool matched = false;
+    walk_attrs(isns_pdu_buf, 4, static_cast<size_t>(r), [&](const attr &a) {
+        if (!after_delim) {
+            after_delim = a.tag == ISNS_TAG_DELIMITER;
+            return true;
+        }
+        if (a.tag == ISNS_TAG_ISCSI_NAME && a.len > 3) {
+            const char *v = reinterpret_cast<const char *>(a.value);
+            const std::string_view got(v, strnlen(v, a.len));
+            if (got == want) {
+                if (isns_trace)
+                    puts("iscsi name matched.");
+                matched = true;
+                return false;
+            }
+            if (isns_trace)
+                printf("get iSCSI name = %.*s , length = %d\n", static_cast<int>(got.size()), got.data(),
+                       static_cast<int>(a.len));
+        } else if (isns_trace) {
+            printf("get tag = %02x%02x%02x%02x , length = %d\n", a.tag >> 24, (a.tag >> 16) & 0xff,
+                   (a.tag >> 8) & 0xff, a.tag & 0xff, static_cast<int>(a.len));
+        }
+        return true;
+    });
+    return matched ? 1 : 0;
+}
