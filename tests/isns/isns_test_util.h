@@ -1,0 +1,65 @@
+// Shared setup of the iSNS client tests: the client's globals in a known state.
+#pragma once
+
+#include <arpa/inet.h>
+#include <cstring>
+#include <string>
+
+#include "common/korvadm_err.h"
+#include "isns/isns_client.h"
+#include "isns/isns_pdu.h"
+#include "isns/isns_transport.h"
+#include "tests/support/isns_test_server.h"
+
+// Byte vectors join with +.
+using korv_test::operator+;
+
+namespace isns_test {
+
+inline void reset_client(const char *server, int family = AF_INET)
+{
+    std::snprintf(isns_server_addr, sizeof isns_server_addr, "%s", server);
+    isns_addr_family = family;
+    std::snprintf(isns_entity_id, sizeof isns_entity_id, "nas1");
+    std::memset(isns_entity_name, 0, sizeof isns_entity_name);
+    isns_trace = 0;
+    isns_alias_on = 0;
+}
+
+// 16-byte portal address from IPv4 (mapped) or IPv6 text.
+inline void portal_addr(const char *text, unsigned char out[16])
+{
+    std::memset(out, 0, 16);
+    in_addr a4;
+    if (inet_pton(AF_INET, text, &a4) == 1) {
+        out[10] = out[11] = 0xff;
+        std::memcpy(out + 12, &a4, 4);
+    } else {
+        inet_pton(AF_INET6, text, out);
+    }
+}
+
+// A node with the given portals (addresses as text, one port for all).
+inline isns_iscsi_node *make_node(const char *name, uint32_t tag, std::initializer_list<const char *> addrs,
+                                  uint32_t port = 3260)
+{
+    isns_iscsi_node *n = isns_iscsi_node_new();
+    std::snprintf(n->name, sizeof n->name, "%s", name);
+    n->pg_tag = tag;
+    for (const char *a : addrs) {
+        isns_ip_portal *p = isns_ip_portal_new();
+        portal_addr(a, p->address);
+        p->port = port;
+        isns_iscsi_node_add_portal(n, p);
+    }
+    return n;
+}
+
+inline korv_test::bytes status_rsp(uint32_t status, uint16_t func = 0x8002)
+{
+    korv_test::bytes payload = {static_cast<uint8_t>(status >> 24), static_cast<uint8_t>(status >> 16),
+                                static_cast<uint8_t>(status >> 8), static_cast<uint8_t>(status)};
+    return korv_test::isns_pdu(func, 0x4c00, payload);
+}
+
+}  // namespace isns_test

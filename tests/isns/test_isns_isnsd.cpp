@@ -1,0 +1,110 @@
+// Registration, check and deregistration against Debian's Open-iSNS server.
+#include <gtest/gtest.h>
+
+#include "tests/isns/isns_test_util.h"
+#include "tests/support/isns_isnsd.h"
+
+using korv_test::isnsd_server;
+using namespace isns_test;
+
+namespace {
+
+constexpr const char *kT1 = "iqn.2026-01.test:nas1.t1";
+constexpr const char *kT2 = "iqn.2026-01.test:nas1.t2";
+
+#define REQUIRE_ISNSD()                                                   \
+    do {                                                                  \
+        if (!korv_test::isnsd_available())                                \
+            GTEST_SKIP() << "isnsd/isnsadm not installed (open-isns-server, open-isns-utils)"; \
+    } while (0)
+
+// Registers the entity with kT1, then kT2, both on the same two portals.
+void register_two_targets()
+{
+    std::snprintf(isns_entity_name, sizeof isns_entity_name, "%s", kT1);
+    isns_iscsi_node *t1 = make_node(kT1, 1, {"192.168.1.10", "2001:db8::10"});
+    isns_iscsi_node *t2 = make_node(kT2, 1, {"192.168.1.10", "2001:db8::10"});
+    EXPECT_EQ(register_entity(t1), 0) << "status " << isns_last_status;
+    EXPECT_EQ(register_node(t2), 0) << "status " << isns_last_status;
+    isns_iscsi_node_free(t1);
+    isns_iscsi_node_free(t2);
+}
+
+}  // namespace
+
+TEST(IsnsOpenIsns, RegistrationLifecycle)
+{
+    REQUIRE_ISNSD();
+    isnsd_server srv("127.10.4.1");
+    ASSERT_TRUE(srv.start()) << srv.error();
+    reset_client("127.10.4.1");
+    register_two_targets();
+
+    const std::string entities = srv.adm("--list entities");
+    EXPECT_NE(entities.find("nas1"), std::string::npos) << entities;
+    const std::string nodes = srv.adm("--list nodes");
+    EXPECT_NE(nodes.find(kT1), std::string::npos) << nodes;
+    EXPECT_NE(nodes.find(kT2), std::string::npos) << nodes;
+    const std::string portals = srv.adm("--list portals");
+    EXPECT_NE(portals.find("192.168.1.10"), std::string::npos) << portals;
+    EXPECT_NE(portals.find("2001:db8::10"), std::string::npos) << portals;
+    EXPECT_NE(portals.find("3260"), std::string::npos) << portals;
+    const std::string groups = srv.adm("--list portal-groups");
+    for (const char *t : {kT1, kT2}) {
+        size_t n = 0;
+        for (size_t at = groups.find(t); at != std::string::npos; at = groups.find(t, at + 1))
+            n++;
+        EXPECT_EQ(n, 2u) << t << " should name both portals:\n" << groups;
+    }
+    EXPECT_NE(groups.find("Portal group tag = 1"), std::string::npos) << groups;
+
+    EXPECT_EQ(isns_check_registration(kT1), 1);
+    EXPECT_EQ(isns_check_registration(kT2), 1);
+
+    EXPECT_EQ(deregister_entity(kT1), 0);
+    EXPECT_EQ(srv.adm("--list nodes").find(kT1), std::string::npos);
+    EXPECT_EQ(isns_check_registration(kT1), 0);
+
+    register_two_targets();
+    EXPECT_EQ(isns_check_registration(kT1), 1);
+    ASSERT_TRUE(srv.restart()) << srv.error();
+    EXPECT_EQ(isns_check_registration(kT1), 0);
+
+    srv.stop();
+    EXPECT_EQ(isns_check_registration(kT1), -1);
+}
+
+TEST(IsnsOpenIsns, FurtherNodeWithForeignPortalIsRefused)
+{
+    REQUIRE_ISNSD();
+    isnsd_server srv("127.10.4.2");
+    ASSERT_TRUE(srv.start()) << srv.error();
+    reset_client("127.10.4.2");
+    std::snprintf(isns_entity_name, sizeof isns_entity_name, "%s", kT1);
+    isns_iscsi_node *t1 = make_node(kT1, 1, {"192.168.1.10"});
+    isns_iscsi_node *t2 = make_node(kT2, 2, {"192.168.1.20"});
+    ASSERT_EQ(register_entity(t1), 0);
+    EXPECT_EQ(register_node(t2), -1);
+    EXPECT_EQ(isns_last_status, 3);
+    EXPECT_EQ(srv.adm("--list nodes").find(kT2), std::string::npos);
+    EXPECT_EQ(isns_check_registration(kT2), 0);
+    EXPECT_EQ(isns_check_registration(kT1), 1);
+    isns_iscsi_node_free(t1);
+    isns_iscsi_node_free(t2);
+}
+
+TEST(IsnsOpenIsns, PortallessNodeIsStoredWithoutType)
+{
+    // The node type goes with the portal groups, so the server keeps the node
+    // but the type-keyed check does not find it.
+    REQUIRE_ISNSD();
+    isnsd_server srv("127.10.4.3");
+    ASSERT_TRUE(srv.start()) << srv.error();
+    reset_client("127.10.4.3");
+    std::snprintf(isns_entity_name, sizeof isns_entity_name, "%s", kT1);
+    isns_iscsi_node *t1 = make_node(kT1, 1, {});
+    ASSERT_EQ(register_entity(t1), 0);
+    EXPECT_NE(srv.adm("--list nodes").find(kT1), std::string::npos);
+    EXPECT_EQ(isns_check_registration(kT1), 0);
+    isns_iscsi_node_free(t1);
+}

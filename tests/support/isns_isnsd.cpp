@@ -1,0 +1,151 @@
+#include "tests/support/isns_isnsd.h"
+
+#include <signal.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <chrono>
+#include <cstdio>
+#include <cstdlib>
+#include <fstream>
+#include <thread>
+
+#include "tests/support/isns_test_server.h"
+
+namespace korv_test {
+
+namespace {
+
+bool executable(const char *path)
+{
+    return access(path, X_OK) == 0;
+}
+
+std::string find_tool(const char *name)
+{
+    for (const char *dir : {"/usr/sbin/", "/usr/bin/", "/sbin/", "/bin/"}) {
+        std::string p = std::string(dir) + name;
+        if (executable(p.c_str()))
+            return p;
+    }
+    return {};
+}
+
+}  // namespace
+
+bool isnsd_available()
+{
+    return !find_tool("isnsd").empty() && !find_tool("isnsadm").empty();
+}
+
+isnsd_server::isnsd_server(std::string address) : address_(std::move(address))
+{
+    char tmpl[] = "/tmp/korv-isnsd-XXXXXX";
+    if (mkdtemp(tmpl))
+        dir_ = tmpl;
+    else
+        error_ = "mkdtemp failed";
+}
+
+isnsd_server::~isnsd_server()
+{
+    stop();
+    if (!dir_.empty())
+        (void)!std::system(("rm -rf '" + dir_ + "'").c_str());
+}
+
+bool isnsd_server::start()
+{
+    if (dir_.empty())
+        return false;
+    if (running())
+        return true;
+    if (tcp_port_open(address_, 3205)) {
+        error_ = "port 3205 on " + address_ + " is already held by another server";
+        return false;
+    }
+    const bool v6 = address_.find(':') != std::string::npos;
+    {
+        std::ofstream conf(dir_ + "/isnsd.conf");
+        conf << "SourceName = iqn.2026-01.test:isnsd\n"
+             << "BindAddress = " << (v6 ? "[" + address_ + "]" : address_) << "\n"
+             << "PIDFile = " << dir_ << "/isnsd.pid\n"
+             << "ControlSocket = " << dir_ << "/isnsctl\n"
+             << "LocalRegistry = " << dir_ << "/isns.registry\n"
+             << "Security = 0\nSLPRegister = 0\nDefaultDiscoveryDomain = 1\n"
+             << "RegistrationPeriod = 0\nESIRetries = 0\n";
+        std::ofstream adm(dir_ + "/isnsadm.conf");
+        adm << "SourceName = iqn.2026-01.test:isnsadm\n"
+            << "ControlSocket = " << dir_ << "/isnsctl\n"
+            << "Security = 0\n";
+    }
+    const std::string isnsd = find_tool("isnsd");
+    const std::string conf = dir_ + "/isnsd.conf";
+    const std::string log = dir_ + "/isnsd.log";
+    std::fflush(nullptr);
+    pid_t pid = fork();
+    if (pid == 0) {
+        FILE *out = std::freopen(log.c_str(), "a", stdout);
+        if (out)
+            dup2(fileno(out), STDERR_FILENO);
+        execl(isnsd.c_str(), "isnsd", "-f", "-c", conf.c_str(), static_cast<char *>(nullptr));
+        _exit(127);
+    }
+    if (pid < 0) {
+        error_ = "fork failed";
+        return false;
+    }
+    pid_ = pid;
+    const auto until = std::chrono::steady_clock::now() + std::chrono::seconds(5);
+    while (std::chrono::steady_clock::now() < until) {
+        int status;
+        if (waitpid(pid_, &status, WNOHANG) == pid_) {
+            pid_ = -1;
+            std::ifstream in(log);
+            std::string text((std::istreambuf_iterator<char>(in)), std::istreambuf_iterator<char>());
+            error_ = "isnsd exited at start: " + text;
+            return false;
+        }
+        if (tcp_port_open(address_, 3205) && access((dir_ + "/isnsctl").c_str(), F_OK) == 0)
+            return true;
+        std::this_thread::sleep_for(std::chrono::milliseconds(5));
+    }
+    error_ = "isnsd did not accept connections within 5 s";
+    stop();
+    return false;
+}
+
+void isnsd_server::stop()
+{
+    if (pid_ <= 0)
+        return;
+    kill(pid_, SIGTERM);
+    int status;
+    waitpid(pid_, &status, 0);
+    pid_ = -1;
+    unlink((dir_ + "/isnsd.pid").c_str());
+    unlink((dir_ + "/isnsctl").c_str());
+}
+
+std::string isnsd_server::adm(const std::string &args, int *status) const
+{
+    const std::string cmd = find_tool("isnsadm") + " -c '" + dir_ + "/isnsadm.conf' --local " + args + " 2>&1";
+    std::string out;
+    std::fflush(nullptr);
+    FILE *p = popen(cmd.c_str(), "r");
+    if (!p) {
+        if (status)
+            *status = -1;
+        return out;
+    }
+    char buf[4096];
+    size_t n;
+    while ((n = std::fread(buf, 1, sizeof buf, p)) > 0)
+        out.append(buf, n);
+    const int rc = pclose(p);
+    if (status)
+        *status = WIFEXITED(rc) ? WEXITSTATUS(rc) : -1;
+    return out;
+}
+
+}  // namespace korv_test

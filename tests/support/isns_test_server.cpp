@@ -1,0 +1,230 @@
+#include "tests/support/isns_test_server.h"
+
+#include <arpa/inet.h>
+#include <fcntl.h>
+#include <netinet/in.h>
+#include <poll.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <chrono>
+#include <cstring>
+
+namespace korv_test {
+
+namespace {
+
+/* Fills a sockaddr for an IPv4 or IPv6 text; 0 on failure. */
+socklen_t make_addr(const std::string &address, int port, sockaddr_storage *ss)
+{
+    std::memset(ss, 0, sizeof *ss);
+    auto *in4 = reinterpret_cast<sockaddr_in *>(ss);
+    if (inet_pton(AF_INET, address.c_str(), &in4->sin_addr) == 1) {
+        in4->sin_family = AF_INET;
+        in4->sin_port = htons(static_cast<uint16_t>(port));
+        return sizeof(sockaddr_in);
+    }
+    auto *in6 = reinterpret_cast<sockaddr_in6 *>(ss);
+    if (inet_pton(AF_INET6, address.c_str(), &in6->sin6_addr) == 1) {
+        in6->sin6_family = AF_INET6;
+        in6->sin6_port = htons(static_cast<uint16_t>(port));
+        return sizeof(sockaddr_in6);
+    }
+    return 0;
+}
+
+void put32(bytes &b, uint32_t v)
+{
+    for (int s = 24; s >= 0; s -= 8)
+        b.push_back(static_cast<uint8_t>(v >> s));
+}
+
+}  // namespace
+
+isns_fake_server::isns_fake_server(const std::string &address, int port)
+{
+    sockaddr_storage ss;
+    const socklen_t len = make_addr(address, port, &ss);
+    if (!len) {
+        error_ = "bad address " + address;
+        return;
+    }
+    int fd = socket(ss.ss_family, SOCK_STREAM | SOCK_CLOEXEC, 0);
+    int one = 1;
+    setsockopt(fd, SOL_SOCKET, SO_REUSEADDR, &one, sizeof one);
+    if (ss.ss_family == AF_INET6)
+        setsockopt(fd, IPPROTO_IPV6, IPV6_V6ONLY, &one, sizeof one);
+    if (fd < 0 || bind(fd, reinterpret_cast<sockaddr *>(&ss), len) != 0 || listen(fd, 8) != 0) {
+        error_ = "cannot listen on " + address + ":" + std::to_string(port) + ": " + std::strerror(errno);
+        if (fd >= 0)
+            close(fd);
+        return;
+    }
+    if (pipe2(stop_pipe_, O_CLOEXEC) != 0) {
+        error_ = "pipe failed";
+        close(fd);
+        return;
+    }
+    listen_fd_ = fd;
+    thread_ = std::thread([this] { serve(); });
+}
+
+isns_fake_server::~isns_fake_server()
+{
+    if (thread_.joinable()) {
+        char c = 'x';
+        (void)!write(stop_pipe_[1], &c, 1);
+        thread_.join();
+    }
+    for (int fd : {listen_fd_, stop_pipe_[0], stop_pipe_[1]})
+        if (fd >= 0)
+            close(fd);
+}
+
+void isns_fake_server::set_reply(isns_fake_reply reply)
+{
+    set_handler([reply](const bytes &) { return reply; });
+}
+
+void isns_fake_server::set_handler(std::function<isns_fake_reply(const bytes &)> handler)
+{
+    std::lock_guard<std::mutex> lock(mu_);
+    handler_ = std::move(handler);
+}
+
+std::vector<bytes> isns_fake_server::requests() const
+{
+    std::lock_guard<std::mutex> lock(mu_);
+    return requests_;
+}
+
+bool isns_fake_server::wait_stop(int ms)
+{
+    pollfd p{stop_pipe_[0], POLLIN, 0};
+    return poll(&p, 1, ms) > 0;
+}
+
+void isns_fake_server::serve()
+{
+    for (;;) {
+        pollfd p[2] = {{stop_pipe_[0], POLLIN, 0}, {listen_fd_, POLLIN, 0}};
+        if (poll(p, 2, -1) < 0 && errno != EINTR)
+            return;
+        if (p[0].revents)
+            return;
+        if (p[1].revents & POLLIN) {
+            int fd = accept4(listen_fd_, nullptr, nullptr, SOCK_CLOEXEC);
+            if (fd >= 0) {
+                serve_one(fd);
+                close(fd);
+            }
+        }
+    }
+}
+
+void isns_fake_server::serve_one(int fd)
+{
+    // The request: 12-byte header, then the length it announces. A client
+    // that sends less is answered anyway after a short wait.
+    bytes req;
+    size_t want = 12;
+    uint8_t buf[4096];
+    while (req.size() < want) {
+        pollfd p[2] = {{stop_pipe_[0], POLLIN, 0}, {fd, POLLIN, 0}};
+        if (poll(p, 2, 2000) <= 0 || p[0].revents)
+            break;
+        ssize_t n = recv(fd, buf, std::min(sizeof buf, want - req.size()), 0);
+        if (n <= 0)
+            break;
+        req.insert(req.end(), buf, buf + n);
+        if (req.size() == 12)
+            want = 12 + ((size_t{req[4]} << 8) | req[5]);
+    }
+    std::function<isns_fake_reply(const bytes &)> handler;
+    {
+        std::lock_guard<std::mutex> lock(mu_);
+        requests_.push_back(req);
+        handler = handler_;
+    }
+    const isns_fake_reply reply = handler ? handler(req) : isns_fake_reply{};
+    const size_t step = reply.chunk ? reply.chunk : reply.data.size();
+    for (size_t off = 0; off < reply.data.size(); off += step) {
+        if (off && reply.chunk_gap_ms && wait_stop(reply.chunk_gap_ms))
+            return;
+        const size_t n = std::min(step, reply.data.size() - off);
+        if (send(fd, reply.data.data() + off, n, MSG_NOSIGNAL) != static_cast<ssize_t>(n))
+            return;
+    }
+    if (reply.hold_ms)
+        wait_stop(reply.hold_ms);
+}
+
+bytes isns_pdu(uint16_t func, uint16_t flags, const bytes &payload)
+{
+    bytes b = {0x00, 0x01,
+               static_cast<uint8_t>(func >> 8), static_cast<uint8_t>(func),
+               static_cast<uint8_t>(payload.size() >> 8), static_cast<uint8_t>(payload.size()),
+               static_cast<uint8_t>(flags >> 8), static_cast<uint8_t>(flags),
+               0, 0, 0, 0};
+    b.insert(b.end(), payload.begin(), payload.end());
+    return b;
+}
+
+bytes isns_attr_raw(uint32_t tag, const bytes &value)
+{
+    bytes b;
+    put32(b, tag);
+    put32(b, static_cast<uint32_t>(value.size()));
+    b.insert(b.end(), value.begin(), value.end());
+    return b;
+}
+
+bytes isns_attr_str(uint32_t tag, const std::string &text)
+{
+    bytes v(text.begin(), text.end());
+    do
+        v.push_back(0);
+    while (v.size() % 4);
+    return isns_attr_raw(tag, v);
+}
+
+bytes isns_attr_u32(uint32_t tag, uint32_t value)
+{
+    bytes v;
+    put32(v, value);
+    return isns_attr_raw(tag, v);
+}
+
+bytes isns_query_rsp(uint32_t status, const std::string &key, const std::vector<std::string> &names)
+{
+    bytes b;
+    put32(b, status);
+    b = b + isns_attr_str(32, key) + isns_attr_raw(0, {});
+    for (const std::string &n : names)
+        b = b + isns_attr_str(32, n);
+    return b;
+}
+
+bytes operator+(bytes a, const bytes &b)
+{
+    a.insert(a.end(), b.begin(), b.end());
+    return a;
+}
+
+bool tcp_port_open(const std::string &address, int port)
+{
+    sockaddr_storage ss;
+    const socklen_t len = make_addr(address, port, &ss);
+    if (!len)
+        return false;
+    int fd = socket(ss.ss_family, SOCK_STREAM | SOCK_CLOEXEC, 0);
+    if (fd < 0)
+        return false;
+    const bool open = connect(fd, reinterpret_cast<sockaddr *>(&ss), len) == 0;
+    close(fd);
+    return open;
+}
+
+}  // namespace korv_test
