@@ -1,1 +1,0 @@
-// Anchor until the client library lands.

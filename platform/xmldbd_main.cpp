@@ -1,0 +1,440 @@
+// xmldbd: the configuration database service. One tree, one Unix socket, one
+// thread; requests from every client are served one at a time in arrival order.
+#include "common/korvadm_sysroot.h"
+#include "platform/xmldb_file.h"
+#include "platform/xmldb_proto.h"
+#include "platform/xmldb_tree.h"
+#include "platform/xmldbc.h"
+
+#include <cerrno>
+#include <climits>
+#include <cstdarg>
+#include <csignal>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <fcntl.h>
+#include <getopt.h>
+#include <memory>
+#include <poll.h>
+#include <string>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/un.h>
+#include <unistd.h>
+#include <vector>
+
+namespace {
+
+constexpr size_t kMaxClients = 256;
+constexpr const char *kDefaultAllowDir = "/etc/NAS_CFG";
+
+volatile sig_atomic_t g_stop = 0;
+
+void on_stop(int) { g_stop = 1; }
+
+void say(const char *fmt, ...) __attribute__((format(printf, 1, 2)));
+void say(const char *fmt, ...)
+{
+    va_list ap;
+    va_start(ap, fmt);
+    std::fputs("xmldbd: ", stderr);
+    std::vfprintf(stderr, fmt, ap);
+    std::fputc('\n', stderr);
+    va_end(ap);
+}
+
+struct Options {
+    std::string socket;
+    std::string load;
+    std::vector<std::string> allow_dirs;
+    int ready_fd = -1;
+};
+
+void usage(FILE *to)
+{
+    std::fprintf(to,
+        "usage: xmldbd [--socket PATH] [--load FILE] [--allow-dir DIR]... [--ready-fd N]\n"
+        "Serves one configuration database tree on a Unix socket.\n"
+        "  --socket PATH     socket to serve (default %s under the system root)\n"
+        "  --load FILE       load this XML file at start (a missing file starts empty)\n"
+        "  --allow-dir DIR   a directory clients may save into (repeatable;\n"
+        "                    default %s under the system root)\n"
+        "  --ready-fd N      write one byte to descriptor N and close it once serving\n"
+        "Paths given here are used as they are. SIGTERM/SIGINT: finish the request\n"
+        "in hand, remove the socket, exit 0.\n",
+        XMLDB_SOCK_ISCSI, kDefaultAllowDir);
+}
+
+// 0 parsed, 1 exit successfully (help), 2 usage error.
+int parse_args(int argc, char **argv, Options &o)
+{
+    static const option longs[] = {
+        {"socket", required_argument, nullptr, 's'},
+        {"load", required_argument, nullptr, 'l'},
+        {"allow-dir", required_argument, nullptr, 'a'},
+        {"ready-fd", required_argument, nullptr, 'r'},
+        {"help", no_argument, nullptr, 'h'},
+        {nullptr, 0, nullptr, 0},
+    };
+    int c;
+    while ((c = getopt_long(argc, argv, "s:l:a:r:h", longs, nullptr)) != -1) {
+        switch (c) {
+        case 's': o.socket = optarg; break;
+        case 'l': o.load = optarg; break;
+        case 'a': o.allow_dirs.emplace_back(optarg); break;
+        case 'r': {
+            char *end = nullptr;
+            long v = std::strtol(optarg, &end, 10);
+            if (*optarg == '\0' || *end != '\0' || v < 0 || v > INT_MAX) {
+                say("bad --ready-fd \"%s\"", optarg);
+                return 2;
+            }
+            o.ready_fd = static_cast<int>(v);
+            break;
+        }
+        case 'h': usage(stdout); return 1;
+        default: usage(stderr); return 2;
+        }
+    }
+    if (optind != argc) {
+        say("unexpected argument \"%s\"", argv[optind]);
+        usage(stderr);
+        return 2;
+    }
+    if (o.socket.empty())
+        o.socket = sysroot_path(XMLDB_SOCK_ISCSI);
+    if (o.allow_dirs.empty())
+        o.allow_dirs.push_back(sysroot_path(kDefaultAllowDir));
+    return 0;
+}
+
+void mkdirs(const std::string &dir)
+{
+    for (size_t i = 1; i <= dir.size(); ++i) {
+        if (i == dir.size() || dir[i] == '/')
+            ::mkdir(dir.substr(0, i).c_str(), 0755);
+    }
+}
+
+std::string parent_of(const std::string &p)
+{
+    size_t s = p.rfind('/');
+    if (s == std::string::npos)
+        return ".";
+    return s == 0 ? "/" : p.substr(0, s);
+}
+
+class Service {
+public:
+    explicit Service(Options o) : opt_(std::move(o)) {}
+    int run();
+
+private:
+    struct Conn {
+        int fd;
+        std::string in;
+        std::string out;
+        size_t out_off = 0;
+        bool closing = false;  // flush out, then close
+    };
+
+    bool listen_socket();
+    void accept_all();
+    bool read_conn(Conn &c);
+    bool write_conn(Conn &c);
+    void handle_frames(Conn &c);
+    void handle(const xmldb::Request &r, std::string &out);
+    bool save_allowed(const std::string &file, std::string &err) const;
+
+    Options opt_;
+    xmldb::Tree tree_;
+    int lfd_ = -1;
+    ino_t sock_ino_ = 0;
+    std::vector<std::unique_ptr<Conn>> conns_;
+};
+
+bool Service::listen_socket()
+{
+    sockaddr_un sa{};
+    sa.sun_family = AF_UNIX;
+    if (opt_.socket.size() >= sizeof sa.sun_path) {
+        say("socket path too long for a Unix socket: %s", opt_.socket.c_str());
+        return false;
+    }
+    std::memcpy(sa.sun_path, opt_.socket.c_str(), opt_.socket.size() + 1);
+    mkdirs(parent_of(opt_.socket));
+
+    struct stat st{};
+    if (::lstat(opt_.socket.c_str(), &st) == 0) {
+        if (!S_ISSOCK(st.st_mode)) {
+            say("%s exists and is not a socket", opt_.socket.c_str());
+            return false;
+        }
+        int probe = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+        bool live = probe >= 0 && ::connect(probe, reinterpret_cast<sockaddr *>(&sa), sizeof sa) == 0;
+        if (probe >= 0)
+            ::close(probe);
+        if (live) {
+            say("another service already answers on %s", opt_.socket.c_str());
+            return false;
+        }
+        ::unlink(opt_.socket.c_str());  // left by a service that died
+    }
+
+    lfd_ = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
+    if (lfd_ < 0) {
+        say("socket: %s", std::strerror(errno));
+        return false;
+    }
+    mode_t old = ::umask(077);  // never visible with wider permissions
+    int rc = ::bind(lfd_, reinterpret_cast<sockaddr *>(&sa), sizeof sa);
+    ::umask(old);
+    if (rc != 0 || ::chmod(opt_.socket.c_str(), 0600) != 0 || ::listen(lfd_, 128) != 0) {
+        say("cannot serve %s: %s", opt_.socket.c_str(), std::strerror(errno));
+        return false;
+    }
+    if (::stat(opt_.socket.c_str(), &st) == 0)
+        sock_ino_ = st.st_ino;
+    return true;
+}
+
+void Service::accept_all()
+{
+    for (;;) {
+        int fd = ::accept4(lfd_, nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK);
+        if (fd < 0)
+            return;
+        if (conns_.size() >= kMaxClients) {
+            ::close(fd);  // the client sees end of stream and fails its call
+            continue;
+        }
+        conns_.push_back(std::make_unique<Conn>(Conn{fd, {}, {}, 0, false}));
+    }
+}
+
+// False when the connection is finished.
+bool Service::read_conn(Conn &c)
+{
+    char buf[65536];
+    ssize_t n = ::recv(c.fd, buf, sizeof buf, 0);
+    if (n == 0)
+        return false;
+    if (n < 0)
+        return errno == EAGAIN || errno == EWOULDBLOCK || errno == EINTR;
+    c.in.append(buf, static_cast<size_t>(n));
+    handle_frames(c);
+    return true;
+}
+
+bool Service::write_conn(Conn &c)
+{
+    while (c.out_off < c.out.size()) {
+        ssize_t n = ::send(c.fd, c.out.data() + c.out_off, c.out.size() - c.out_off, MSG_NOSIGNAL);
+        if (n < 0)
+            return errno == EAGAIN || errno == EWOULDBLOCK || errno == EINTR;
+        c.out_off += static_cast<size_t>(n);
+    }
+    c.out.clear();
+    c.out_off = 0;
+    return !c.closing;
+}
+
+void Service::handle_frames(Conn &c)
+{
+    size_t off = 0;
+    while (!c.closing && c.in.size() - off >= xmldb::kHeaderSize) {
+        uint32_t len = xmldb::load_be32(reinterpret_cast<const unsigned char *>(c.in.data() + off));
+        if (len == 0 || len > xmldb::kRequestMax) {
+            // The stream cannot be resynchronised: answer once, then hang up.
+            xmldb::encode_answer(c.out, xmldb::kFail, "request length out of bounds");
+            c.closing = true;
+            break;
+        }
+        if (c.in.size() - off - xmldb::kHeaderSize < len)
+            break;
+        std::string_view payload(c.in.data() + off + xmldb::kHeaderSize, len);
+        xmldb::Request r{};
+        if (xmldb::decode_request(payload, r))
+            handle(r, c.out);
+        else
+            xmldb::encode_answer(c.out, xmldb::kFail, "malformed request");
+        off += xmldb::kHeaderSize + len;
+    }
+    c.in.erase(0, off);
+}
+
+bool Service::save_allowed(const std::string &file, std::string &err) const
+{
+    if (file.empty() || file[0] != '/') {
+        err = "file path must be absolute";
+        return false;
+    }
+    std::string base = file.substr(file.rfind('/') + 1);
+    if (base.empty() || base == "." || base == "..") {
+        err = "file path names no file";
+        return false;
+    }
+    char dir[PATH_MAX];
+    if (!::realpath(parent_of(file).c_str(), dir)) {
+        err = "cannot resolve " + parent_of(file) + ": " + std::strerror(errno);
+        return false;
+    }
+    std::string d = dir;
+    for (const auto &a : opt_.allow_dirs) {
+        char ad[PATH_MAX];
+        if (!::realpath(a.c_str(), ad))
+            continue;
+        std::string allowed = ad;
+        if (d == allowed || allowed == "/" ||
+            (d.size() > allowed.size() && d.compare(0, allowed.size(), allowed) == 0 && d[allowed.size()] == '/'))
+            return true;
+    }
+    err = "saving outside the allowed directories is refused: " + file;
+    return false;
+}
+
+void Service::handle(const xmldb::Request &r, std::string &out)
+{
+    using xmldb::Op;
+    std::string err;
+    switch (r.op) {
+    case Op::Get:
+        xmldb::encode_answer(out, xmldb::kOk, tree_.get(r.path));
+        return;
+    case Op::Set:
+        if (!tree_.set(r.path, r.value)) {
+            xmldb::encode_answer(out, xmldb::kFail, "path names no node or is too deep");
+            return;
+        }
+        xmldb::encode_answer(out, xmldb::kOk, {});
+        return;
+    case Op::Del:
+        tree_.del(r.path);
+        xmldb::encode_answer(out, xmldb::kOk, {});
+        return;
+    case Op::Dump:
+        xmldb::encode_answer(out, xmldb::kOk, tree_.dump(r.path));
+        return;
+    case Op::Ping:
+        xmldb::encode_answer(out, xmldb::kOk, "xmldbd");
+        return;
+    case Op::Save: {
+        std::string file(r.path);
+        if (!save_allowed(file, err) || !xmldb::write_file_atomic(file, tree_.to_xml(), err)) {
+            say("save: %s", err.c_str());
+            xmldb::encode_answer(out, xmldb::kFail, err);
+            return;
+        }
+        xmldb::encode_answer(out, xmldb::kOk, {});
+        return;
+    }
+    case Op::Load: {
+        std::string text;
+        if (!xmldb::read_file(std::string(r.path), text, err) || !tree_.from_xml(text, err)) {
+            xmldb::encode_answer(out, xmldb::kFail, err);
+            return;
+        }
+        xmldb::encode_answer(out, xmldb::kOk, {});
+        return;
+    }
+    }
+    xmldb::encode_answer(out, xmldb::kFail, "unknown operation");
+}
+
+int Service::run()
+{
+    if (!opt_.load.empty()) {
+        std::string text, err;
+        if (::access(opt_.load.c_str(), F_OK) != 0 && errno == ENOENT) {
+            say("%s does not exist yet; starting with an empty tree", opt_.load.c_str());
+        } else if (!xmldb::read_file(opt_.load, text, err) || !tree_.from_xml(text, err)) {
+            // Starting empty would let the next save overwrite the operator's file.
+            say("cannot load %s: %s", opt_.load.c_str(), err.c_str());
+            return 1;
+        }
+    }
+    for (const auto &d : opt_.allow_dirs)
+        mkdirs(d);
+    if (!listen_socket())
+        return 1;
+    if (opt_.ready_fd >= 0) {
+        (void)!::write(opt_.ready_fd, "1", 1);
+        ::close(opt_.ready_fd);
+    }
+
+    sigset_t unblocked;
+    sigprocmask(SIG_SETMASK, nullptr, &unblocked);
+    sigdelset(&unblocked, SIGTERM);
+    sigdelset(&unblocked, SIGINT);
+
+    std::vector<pollfd> pfds;
+    while (!g_stop) {
+        pfds.clear();
+        pfds.push_back({lfd_, POLLIN, 0});
+        for (const auto &c : conns_) {
+            // Read no more from a client until it has taken its answers.
+            short ev = c->out.empty() ? POLLIN : POLLOUT;
+            pfds.push_back({c->fd, ev, 0});
+        }
+        int n = ::ppoll(pfds.data(), pfds.size(), nullptr, &unblocked);
+        if (n < 0) {
+            if (errno == EINTR)
+                continue;
+            say("poll: %s", std::strerror(errno));
+            break;
+        }
+        for (size_t i = 1; i < pfds.size(); ++i) {
+            Conn &c = *conns_[i - 1];
+            bool keep = true;
+            if (pfds[i].revents & (POLLIN | POLLHUP | POLLERR)) {
+                if (pfds[i].events & POLLIN)
+                    keep = read_conn(c);
+                else if (pfds[i].revents & (POLLHUP | POLLERR))
+                    keep = false;
+            }
+            if (keep && !c.out.empty())
+                keep = write_conn(c);  // most answers go out at once
+            if (!keep) {
+                ::close(c.fd);
+                c.fd = -1;
+            }
+        }
+        std::erase_if(conns_, [](const auto &c) { return c->fd < 0; });
+        if (pfds[0].revents & POLLIN)
+            accept_all();
+    }
+
+    for (const auto &c : conns_)
+        ::close(c->fd);
+    struct stat st{};
+    // Remove the socket only if it is still ours, not a successor's.
+    if (::stat(opt_.socket.c_str(), &st) == 0 && st.st_ino == sock_ino_)
+        ::unlink(opt_.socket.c_str());
+    ::close(lfd_);
+    return 0;
+}
+
+}  // namespace
+
+int main(int argc, char **argv)
+{
+    Options o;
+    int rc = parse_args(argc, argv, o);
+    if (rc != 0)
+        return rc == 1 ? 0 : 2;
+
+    struct sigaction sa{};
+    sa.sa_handler = on_stop;
+    sigemptyset(&sa.sa_mask);
+    sigaction(SIGTERM, &sa, nullptr);
+    sigaction(SIGINT, &sa, nullptr);
+    signal(SIGPIPE, SIG_IGN);
+    sigset_t block;
+    sigemptyset(&block);
+    sigaddset(&block, SIGTERM);
+    sigaddset(&block, SIGINT);
+    sigprocmask(SIG_BLOCK, &block, nullptr);  // delivered only inside ppoll
+
+    return Service(std::move(o)).run();
+}

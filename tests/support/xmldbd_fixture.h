@@ -1,0 +1,93 @@
+// Test support: a private system root per test process, and real xmldbd
+// services serving the configuration (and system-information) databases in it.
+//
+//   korv_test::SysRoot::path()        the root (created on first use)
+//   korv_test::XmldbService db;       configuration database, empty tree
+//   korv_test::XmldbService db(korv_test::kWithSysinfo);   plus the sysinfo database
+//
+// The root is a mkdtemp directory, exported as NESRAD_SYSROOT before the
+// library reads it (the library reads it once per process). When one process
+// runs several test cases the root is shared; XmldbService still starts each
+// service with an empty tree. Make sure SysRoot::path() (or an XmldbService)
+// comes before any code that maps a system path, e.g. at the top of the test.
+#pragma once
+
+#include <string>
+#include <sys/types.h>
+
+namespace korv_test {
+
+class SysRoot {
+public:
+    // The root directory, created and exported on first use. Fails the
+    // process loudly if the library had already read another root.
+    static const std::string &path();
+    // root + abs (abs starts with '/').
+    static std::string file(const std::string &abs);
+    // Writes content to root + abs, creating parent directories.
+    static void write(const std::string &abs, const std::string &content);
+    // Contents of root + abs ("" when unreadable).
+    static std::string read(const std::string &abs);
+    // Creates root + abs and its parents as directories.
+    static void mkdirs(const std::string &abs);
+    // Removes root + abs recursively (nothing when absent).
+    static void remove(const std::string &abs);
+};
+
+// Path of the built xmldbd and xmldbc executables.
+std::string xmldbd_binary();
+std::string xmldbc_binary();
+
+// XmldbService's first argument: also serve "/var/run/xmldb_sock_sysinfo".
+inline constexpr bool kWithSysinfo = true;
+
+// One xmldbd process on a socket (a mapped path), ready when constructed.
+class XmldbProcess {
+public:
+    XmldbProcess(std::string socket, std::string load_file = {});
+    ~XmldbProcess();
+    XmldbProcess(const XmldbProcess &) = delete;
+    XmldbProcess &operator=(const XmldbProcess &) = delete;
+
+    // Starts the service (no-op when running); returns when it is serving.
+    // Throws std::runtime_error when it does not come up within 10 s.
+    void start();
+    // SIGTERM and wait; the service removes its socket.
+    void stop();
+    // Sends sig (default SIGKILL; it must end the process) and reaps the
+    // process; the socket stays behind.
+    void kill(int sig = 9);
+    bool running() const { return pid_ > 0; }
+    pid_t pid() const { return pid_; }
+    const std::string &socket() const { return socket_; }
+
+private:
+    std::string socket_;
+    std::string load_;
+    pid_t pid_ = -1;
+};
+
+// The configuration database service (and optionally the sysinfo one) in the
+// process's SysRoot, each with an empty tree; load_file (a real path) is an
+// XML file the configuration service loads at every start instead.
+class XmldbService {
+public:
+    explicit XmldbService(bool sysinfo = false, std::string load_file = {});
+    ~XmldbService() = default;
+
+    XmldbProcess &config() { return config_; }
+    XmldbProcess &sysinfo();  // requires sysinfo
+
+    // Stops (SIGTERM) / kills (SIGKILL) / restarts the configuration service.
+    // A restart begins with an empty tree unless load_file was given.
+    void stop() { config_.stop(); }
+    void kill() { config_.kill(); }
+    void restart();
+
+private:
+    bool with_sysinfo_;
+    XmldbProcess config_;
+    XmldbProcess sysinfo_;
+};
+
+}  // namespace korv_test
