@@ -51,7 +51,7 @@ char *str_ndup(const char *src, size_t max_len);
 /* The three converters: 0 with *value set and *endptr after the digits
  * (trailing text is accepted); -9989 for a NULL str or value; -1 on overflow,
  * a parse error or no digits ("No digits were found" on standard error).
- * REQUIRES: endptr is not NULL.
+ * endptr may be NULL when the caller does not need it.
  * convert_dec_str_to_uint64_t parses signed: values above LLONG_MAX overflow. */
 int convert_dec_str_to_uint64_t(const char *str, char **endptr, uint64_t *value);
 int convert_hex_str_to_l(const char *str, char **endptr, long *value);

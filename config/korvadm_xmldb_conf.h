@@ -53,8 +53,8 @@ int _xmldb_dec_target_lun_map_cnt(int target_id);
 int _xmldb_update_current_aclcnt(void);
 int xmldb_update_current_aclcnt(void);
 
-/* Entry number of the named target (>= 1), -9989 when it is not found or the
- * name is NULL, -9981 on a scan failure. */
+/* Entry number of the named target (>= 1); -9980 when it is not found,
+ * -9989 for NULL, -9981 on a scan failure. */
 int _xmldb_get_target_dbidx_by_name(const char *name);
 
 /* ---- targets: at most 64 under "/iscsi/target", keyed by "name" ---- */
