@@ -113,6 +113,15 @@ int is_ipv6_link_local(const char *text);
 
 #ifdef __cplusplus
 }
+
+#include <string>
+
+namespace korv {
+/* src with a backslash before each $, ", \ and `, for use inside a
+ * double-quoted shell word (the platform's str_insert_back_slash). False
+ * (out untouched) for NULL or when memory is short. */
+bool shell_escape(const char *src, std::string &out);
+}  // namespace korv
 #endif
 
 #endif

@@ -5,7 +5,7 @@
  *
  *   /sys/kernel/config/target/
  *     iscsi/<iqn>/tpgt_<n>/        T, the portal group of a target
- *       enable, attrib/*, param/*    switches and parameters
+ *       enable, attrib/, param/      switches and parameters
  *       np/<addr>:<port>             network portals ("[v6]:port", "[v6%if]:port")
  *       acls/<initiator>/            per-initiator auth/, attrib/, lun_<m>/
  *       lun/lun_<m>/<lun name>       link to the backstore

@@ -1,1 +1,0 @@
-// Anchor so this directory's library is never an empty archive.

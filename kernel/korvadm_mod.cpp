@@ -1,0 +1,257 @@
+// The driver table selection, the iscsi_mod_ wrappers and the driver's records.
+#include "kernel/korvadm_mod.h"
+
+#include <cstdlib>
+#include <cstring>
+
+#include "common/korvadm_err.h"
+#include "common/korvadm_log.h"
+#include "kernel/korvadm_mod_lio4.h"
+
+const iscsi_mod_ops_t *iscsi_mod_ops = nullptr;
+
+/* ---------------------------------------------------------------- records */
+
+iscsi_target_t *iscsi_target_new(void)
+{
+    auto *t = static_cast<iscsi_target_t *>(std::calloc(1, sizeof(iscsi_target_t)));
+    if (!t)
+        return nullptr;
+    t->tpgt = -1;
+    list_init(&t->ip_list);
+    list_node_init(&t->node, t);
+    return t;
+}
+
+void iscsi_target_free(iscsi_target_t *target)
+{
+    if (!target)
+        return;
+    list_remove(&target->node);
+    iscsi_ip_free_list(&target->ip_list);
+    std::free(target);
+}
+
+iscsi_lun_t *iscsi_lun_new(void)
+{
+    auto *l = static_cast<iscsi_lun_t *>(std::calloc(1, sizeof(iscsi_lun_t)));
+    if (!l)
+        return nullptr;
+    l->lun_num = -1;
+    l->hba_id = -1;
+    list_node_init(&l->node, l);
+    return l;
+}
+
+void iscsi_lun_free(iscsi_lun_t *lun)
+{
+    if (!lun)
+        return;
+    list_remove(&lun->node);
+    std::free(lun);
+}
+
+/* -------------------------------------------------------------- selection */
+
+int iscsi_mod_select(int type)
+{
+    if (type < 0)
+        return ERR_PARAM;
+    if (type != ISCSI_MOD_TYPE_LIO)
+        return ERR_MODULE_TYPE;
+    iscsi_mod_ops = &lio3_mod_ops;
+    return KORV_OK;
+}
+
+/* --------------------------------------------------------------- wrappers */
+
+namespace {
+
+// The common tail of every wrapper once its arguments are checked: the
+// table, then the slot. `no_table` is what the wrapper answers without one.
+template <class Slot, class... Args>
+int call_slot(Slot iscsi_mod_ops_t::*slot, int no_table, Args... args)
+{
+    const iscsi_mod_ops_t *ops = iscsi_mod_ops;
+    if (!ops)
+        return no_table;
+    Slot fn = ops->*slot;
+    if (!fn)
+        return ERR_OP_NOT_PROVIDED;
+    return fn(args...);
+}
+
+}  // namespace
+
+int iscsi_mod_start(void)
+{
+    return call_slot(&iscsi_mod_ops_t::start_module, ERR_MODULE_START);
+}
+
+int iscsi_mod_stop(void)
+{
+    return call_slot(&iscsi_mod_ops_t::stop_module, ERR_MODULE_START);
+}
+
+int iscsi_mod_get_state(void)
+{
+    return call_slot(&iscsi_mod_ops_t::get_module_state, 1);
+}
+
+int iscsi_mod_add_target(iscsi_target_t *target)
+{
+    if (!target)
+        return ERR_PARAM;
+    return call_slot(&iscsi_mod_ops_t::add_target, ERR_PARAM, target);
+}
+
+int iscsi_mod_del_target(iscsi_target_t *target)
+{
+    if (!target)
+        return ERR_PARAM;
+    return call_slot(&iscsi_mod_ops_t::del_target, ERR_PARAM, target);
+}
+
+int iscsi_mod_enable_target(iscsi_target_t *target)
+{
+    if (!target)
+        return ERR_PARAM;
+    return call_slot(&iscsi_mod_ops_t::enable_target, ERR_PARAM, target);
+}
+
+int iscsi_mod_disable_target(iscsi_target_t *target)
+{
+    if (!target)
+        return ERR_PARAM;
+    return call_slot(&iscsi_mod_ops_t::disable_target, ERR_PARAM, target);
+}
+
+int iscsi_mod_set_target_chap(iscsi_target_t *target)
+{
+    if (!target)
+        return ERR_PARAM;
+    return call_slot(&iscsi_mod_ops_t::set_target_chap, ERR_PARAM, target);
+}
+
+int iscsi_mod_set_target_ip(iscsi_target_t *target)
+{
+    if (!target)
+        return ERR_PARAM;
+    return call_slot(&iscsi_mod_ops_t::set_target_ip, ERR_PARAM, target);
+}
+
+int iscsi_mod_set_dataout_timeout(int timeout, iscsi_target_t *target)
+{
+    if (timeout < 0 || !target)
+        return ERR_PARAM;
+    return call_slot(&iscsi_mod_ops_t::set_target_attr_dataout_timeout, ERR_PARAM, timeout, target);
+}
+
+int iscsi_mod_get_target_ip_list(list_t *ip_list, iscsi_target_t *target)
+{
+    if (!ip_list || !target)
+        return ERR_PARAM;
+    return call_slot(&iscsi_mod_ops_t::get_target_existing_ip_list, ERR_PARAM, ip_list, target);
+}
+
+int iscsi_mod_add_backstore(iscsi_lun_t *lun)
+{
+    if (!lun)
+        return ERR_PARAM;
+    return call_slot(&iscsi_mod_ops_t::add_backstore, ERR_PARAM, lun);
+}
+
+int iscsi_mod_del_backstore(iscsi_lun_t *lun)
+{
+    if (!lun)
+        return ERR_PARAM;
+    // No table is a start failure here, not a parameter error.
+    return call_slot(&iscsi_mod_ops_t::del_backstore, ERR_MODULE_START, lun);
+}
+
+int iscsi_mod_shutdown_backstore(iscsi_lun_t *lun)
+{
+    if (!lun)
+        return ERR_PARAM;
+    return call_slot(&iscsi_mod_ops_t::shutdown_backstore, ERR_PARAM, lun);
+}
+
+int iscsi_mod_change_backstore_size(iscsi_lun_t *lun)
+{
+    if (!lun)
+        return ERR_PARAM;
+    return call_slot(&iscsi_mod_ops_t::change_backstore_size, ERR_PARAM, lun);
+}
+
+int iscsi_mod_add_lun_mapping(iscsi_lun_t *lun, iscsi_target_t *target, int lun_number)
+{
+    if (!lun || !target || lun_number < 0)
+        return ERR_PARAM;
+    return call_slot(&iscsi_mod_ops_t::add_lun_mapping, ERR_PARAM, lun, target, lun_number);
+}
+
+int iscsi_mod_del_lun_mapping(iscsi_lun_t *lun, iscsi_target_t *target)
+{
+    if (!lun || !target)
+        return ERR_PARAM;
+    return call_slot(&iscsi_mod_ops_t::del_lun_mapping, ERR_PARAM, lun, target);
+}
+
+int iscsi_mod_add_acl_initiator(const char *initiator_name, iscsi_target_t *target)
+{
+    if (!initiator_name || !target)
+        return ERR_PARAM;
+    return call_slot(&iscsi_mod_ops_t::add_acl_initiator, ERR_PARAM, initiator_name, target);
+}
+
+int iscsi_mod_del_acl_initiator(const char *initiator_name, iscsi_target_t *target)
+{
+    if (!initiator_name || !target)
+        return ERR_PARAM;
+    return call_slot(&iscsi_mod_ops_t::del_acl_initiator, ERR_PARAM, initiator_name, target);
+}
+
+int iscsi_mod_add_lun_acl(iscsi_lun_acl_t *lun_acl)
+{
+    if (!lun_acl || !lun_acl->map_lun || !lun_acl->initiator)
+        return ERR_PARAM;
+    return call_slot(&iscsi_mod_ops_t::add_lun_acl, ERR_PARAM, lun_acl);
+}
+
+int iscsi_mod_del_lun_acl(iscsi_lun_acl_t *lun_acl)
+{
+    if (!lun_acl || !lun_acl->map_lun || !lun_acl->initiator)
+        return ERR_PARAM;
+    return call_slot(&iscsi_mod_ops_t::del_lun_acl, ERR_PARAM, lun_acl);
+}
+
+int iscsi_mod_get_target_session(list_t *sess_list, list_t *initiator_list, iscsi_target_t *target)
+{
+    if (!sess_list || !initiator_list || !target)
+        return ERR_PARAM;
+    return call_slot(&iscsi_mod_ops_t::get_target_session, ERR_PARAM, sess_list, initiator_list, target);
+}
+
+int iscsi_mod_get_target_ip_list_in_target_parm(list_t *ip_list, const char *target_iqn, int tpgt)
+{
+    if (!ip_list || !target_iqn || !*target_iqn || tpgt < 0 || !iscsi_mod_ops)
+        return ERR_PARAM;
+    if (std::strlen(target_iqn) >= ISCSI_TARGET_IQN_LEN) {
+        DBG(0, "target iqn is too long: %s", target_iqn);
+        return ERR_PARAM;
+    }
+    iscsi_target_t *target = iscsi_target_new();
+    if (!target) {
+        DBG(0, "new iscsi_target_t failed");
+        return ERR_NO_MEMORY;
+    }
+    std::strcpy(target->iqn, target_iqn);
+    target->tpgt = tpgt;
+    int rc = iscsi_mod_get_target_ip_list(ip_list, target);
+    iscsi_target_free(target);
+    if (rc != 0) {
+        DBG(0, "get_target_exist_ip_list failed, rc = %d", rc);
+        return ERR_CONFIGFS;
+    }
+    return KORV_OK;
+}

@@ -1,0 +1,276 @@
+// Commands, files and locks: the utility layer against the real file system,
+// shell and System V semaphores.
+#include "common/korvadm_utils.h"
+
+#include <signal.h>
+#include <sys/ipc.h>
+#include <sys/sem.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <chrono>
+#include <string>
+
+#include <gtest/gtest.h>
+
+#include "tests/kernel/kernel_root.h"
+
+namespace {
+
+using korv_test::KernelRoot;
+
+class UtilsTest : public KernelRoot {};
+
+TEST_F(UtilsTest, KernelModuleCheckMatchesSubstringsOfProcModules)
+{
+    EXPECT_EQ(check_kmodule_inserted("target_core_mod"), -1);  // no /proc/modules at all
+    write_file(at("/proc/modules"), "configfs 57344 2 - Live 0x0\ntarget_core_mod 16384 0 - Live 0x0\n");
+    EXPECT_EQ(check_kmodule_inserted("target_core_mod"), 0);
+    EXPECT_EQ(check_kmodule_inserted("core_mod"), 0);  // plain substring match
+    EXPECT_EQ(check_kmodule_inserted("iscsi_target_mod"), -1);
+    EXPECT_EQ(check_kmodule_inserted(nullptr), -1);
+}
+
+TEST_F(UtilsTest, MakeDirIncludeParentCreatesEveryLevelAndIsRepeatable)
+{
+    std::string path = at("/a/b/c");
+    ASSERT_EQ(make_dir_include_parent(path.c_str(), 0), 0);
+    for (const char *p : {"/a", "/a/b", "/a/b/c"}) {
+        struct stat st;
+        ASSERT_EQ(stat(at(p).c_str(), &st), 0) << p;
+        EXPECT_TRUE(S_ISDIR(st.st_mode));
+        EXPECT_EQ(st.st_mode & 07777, 0700u) << p;
+    }
+    EXPECT_EQ(make_dir_include_parent(path.c_str(), 0), 0);
+    // A file in the way is a failure, not an existing directory.
+    write_file(at("/f"), "x");
+    EXPECT_EQ(make_dir_include_parent(at("/f/g").c_str(), 0), -1);
+    EXPECT_EQ(make_dir_include_parent(at("/f").c_str(), 0), -1);
+    EXPECT_EQ(make_dir_include_parent(nullptr, 0), -1);
+}
+
+TEST_F(UtilsTest, RemovalHelpersTreatMissingAsDoneAndNeverRunNames)
+{
+    EXPECT_EQ(remove_dir(at("/missing").c_str()), 0);
+    EXPECT_EQ(remove_file(at("/missing").c_str()), 0);
+    EXPECT_EQ(remove_dir_recurive(""), 0);
+    EXPECT_EQ(remove_dir_recurive(nullptr), -1);
+
+    // A name that would run a command if it reached the shell unescaped.
+    std::string canary = at("/CANARY");
+    std::string tree = at("/t\"; touch " + canary + "; echo \"$(touch " + canary + ")`touch " + canary + "`");
+    mkdirs(tree + "/sub");
+    write_file(tree + "/sub/file", "x");
+    EXPECT_EQ(remove_dir_recurive(tree.c_str()), 0);
+    EXPECT_FALSE(exists(tree));
+    EXPECT_FALSE(exists(canary));
+
+    mkdirs(at("/full/x"));
+    EXPECT_EQ(remove_dir(at("/full").c_str()), -1);  // not empty
+}
+
+TEST_F(UtilsTest, AllocatedSizeOfASparseFileIsBelowItsLength)
+{
+    std::string path = at("/sparse");
+    write_file(path, "");
+    ASSERT_EQ(truncate(path.c_str(), 64 << 20), 0);
+    unsigned long long size = 1;
+    ASSERT_EQ(get_file_alloc_size(&size, path.c_str()), 0);
+    EXPECT_LT(size, 64ull << 20);
+
+    write_file(path, std::string(8192, 'x'));
+    ASSERT_EQ(get_file_alloc_size(&size, path.c_str()), 0);
+    EXPECT_GE(size, 8192ull);
+    EXPECT_EQ(size % 512, 0u);
+
+    EXPECT_EQ(get_file_alloc_size(&size, at("/missing").c_str()), -1);
+    EXPECT_EQ(size, 0u);
+}
+
+TEST_F(UtilsTest, SymlinkOverAnExistingLink)
+{
+    std::string link = at("/link");
+    ASSERT_EQ(create_symlink("/target/one", link.c_str()), 0);
+    EXPECT_EQ(create_symlink("/target/one", link.c_str()), 0);   // same target
+    EXPECT_EQ(create_symlink("/target/two", link.c_str()), -2);  // taken
+    char buf[64] = {0};
+    ASSERT_GT(readlink(link.c_str(), buf, sizeof buf - 1), 0);
+    EXPECT_STREQ(buf, "/target/one");
+
+    write_file(at("/plain"), "x");
+    EXPECT_EQ(create_symlink("/target/one", at("/plain").c_str()), -1);  // not a link
+    EXPECT_EQ(create_symlink("/t", at("/no/such/dir/link").c_str()), -1);
+}
+
+TEST_F(UtilsTest, FileCreationAndWritabilityProbe)
+{
+    std::string path = at("/new");
+    EXPECT_EQ(create_file_if_absent(path.c_str(), 0700), 0);
+    EXPECT_TRUE(exists(path));
+    write_file(path, "keep");
+    EXPECT_EQ(create_file_if_absent(path.c_str(), 0700), 0);
+    EXPECT_EQ(read_file(path), "keep");
+
+    mkdirs(at("/vol"));
+    EXPECT_EQ(check_dir_is_writable(at("/vol").c_str(), ".iscsi_vol_test.temp", (1 << 20) + 17), 0);
+    EXPECT_FALSE(exists(at("/vol/.iscsi_vol_test.temp")));
+    EXPECT_EQ(check_dir_is_writable(at("/nodir").c_str(), ".iscsi_vol_test.temp", 1), -1);
+    EXPECT_EQ(check_dir_is_writable(at("/vol").c_str(), nullptr, 1), -1);
+}
+
+TEST_F(UtilsTest, PathChecks)
+{
+    write_file(at("/ro"), "x");
+    chmod(at("/ro").c_str(), 0400);
+    EXPECT_EQ(check_path_exist(at("/ro").c_str()), 0);
+    EXPECT_EQ(check_path_exist(at("/none").c_str()), -1);
+    EXPECT_EQ(check_path_exist(""), -1);
+    EXPECT_EQ(check_path_access(at("/ro").c_str(), R_OK), 0);
+    EXPECT_EQ(check_path_access(at("/ro").c_str(), X_OK), -1);
+}
+
+TEST_F(UtilsTest, RunSystemCmdEscapesItsArgumentAndRefusesOddFormats)
+{
+    std::string canary = at("/CANARY");
+    std::string out = at("/out");
+    std::string arg = "$(touch " + canary + ")`touch " + canary + "`\"x";
+    std::string fmt = "printf '%%s' \"%s\" > " + out;
+    EXPECT_EQ(run_system_cmd(fmt.c_str(), arg.c_str()), 0);
+    EXPECT_EQ(read_file(out), arg);
+    EXPECT_FALSE(exists(canary));
+
+    EXPECT_EQ(run_system_cmd("exit 3 # \"%s\"", "x"), -1);
+    EXPECT_EQ(run_system_cmd("touch \"%s\" %d", canary.c_str()), -1);  // would read a missing int
+    EXPECT_FALSE(exists(canary));
+}
+
+TEST_F(UtilsTest, RetriedCommandRunsUntilSuccessOrTriesRunOut)
+{
+    std::string count = at("/count");
+    std::string fail = "echo x >> " + count + "; exit 2";
+    int status = process_system_cmd_mt(fail.c_str(), 3, 1000);
+    EXPECT_EQ(read_file(count), "x\nx\nx\n");
+    EXPECT_TRUE(WIFEXITED(status));
+    EXPECT_EQ(WEXITSTATUS(status), 2);
+
+    // One try never waits, however long the allowed delay.
+    write_file(count, "");
+    auto start = std::chrono::steady_clock::now();
+    EXPECT_NE(process_system_cmd_mt(fail.c_str(), 1, 2000000000), 0);
+    EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(10));
+    EXPECT_EQ(read_file(count), "x\n");
+
+    std::string ok = "echo y >> " + count;
+    write_file(count, "");
+    EXPECT_EQ(process_system_cmd_mt(ok.c_str(), 3, 1000), 0);
+    EXPECT_EQ(read_file(count), "y\n");
+    EXPECT_EQ(process_system_cmd_mt(ok.c_str(), 0, 1000), 0);
+    EXPECT_EQ(read_file(count), "y\n");
+}
+
+TEST_F(UtilsTest, SemaphoreIsRecreatedAfterTheLastHolderLeaves)
+{
+    key_t key = static_cast<key_t>(0x4b000000 | (getpid() & 0xffffff));
+    int id = -1;
+    ASSERT_EQ(sem_P(&id, key), 0);
+    ASSERT_GE(id, 0);
+    EXPECT_EQ(semctl(id, 0, GETVAL), 0);  // held
+
+    EXPECT_EQ(sem_V(&id, key), 0);  // nobody waits: removed
+    EXPECT_EQ(id, -1);
+    EXPECT_EQ(semget(key, 1, 0666), -1);
+
+    ASSERT_EQ(sem_P(&id, key), 0);  // recreated at 1, taken at once
+    ASSERT_GE(id, 0);
+    EXPECT_EQ(semctl(id, 0, GETVAL), 0);
+    EXPECT_EQ(sem_V(&id, key), 0);
+    if (id >= 0)
+        semctl(id, 0, IPC_RMID);
+}
+
+TEST_F(UtilsTest, StopPreallocSignalsOnlyALivePidFromItsFile)
+{
+    pid_t child = fork();
+    ASSERT_GE(child, 0);
+    if (child == 0) {
+        pause();
+        _exit(0);
+    }
+    write_file(at("/var/run/prealloc_lun1.pid"), std::to_string(child) + "\n");
+    write_file(at("/var/run/prealloc_bad.pid"), "0\n");
+    stop_prealloc("bad");
+    stop_prealloc("missing");
+    stop_prealloc("");
+    stop_prealloc("../lun1");
+    stop_prealloc(nullptr);
+    int status = 0;
+    EXPECT_EQ(waitpid(child, &status, WNOHANG), 0);  // none of those reached it
+
+    stop_prealloc("lun1");
+    ASSERT_EQ(waitpid(child, &status, 0), child);
+    EXPECT_TRUE(WIFSIGNALED(status));
+    EXPECT_EQ(WTERMSIG(status), SIGTERM);
+}
+
+TEST_F(UtilsTest, NameCharacters)
+{
+    EXPECT_EQ(check_name_chars_valid("iqn.2026-01.test:disk-1"), 0);
+    EXPECT_EQ(check_name_chars_valid(std::string(223, 'a').c_str()), 0);
+    EXPECT_EQ(check_name_chars_valid(std::string(224, 'a').c_str()), -1);
+    EXPECT_EQ(check_name_chars_valid(""), -1);
+    EXPECT_EQ(check_name_chars_valid(nullptr), -1);
+    for (const char *bad : {"Upper", "a_b", "a b", "a/b", "a%b"})
+        EXPECT_EQ(check_name_chars_valid(bad), -1) << bad;
+}
+
+std::string hex(const unsigned char b[16])
+{
+    static const char digits[] = "0123456789abcdef";
+    std::string s;
+    for (int i = 0; i < 16; ++i) {
+        s += digits[b[i] >> 4];
+        s += digits[b[i] & 15];
+    }
+    return s;
+}
+
+TEST_F(UtilsTest, Ipv6TextToBytes)
+{
+    unsigned char b[16];
+    struct {
+        const char *text;
+        const char *bytes;
+    } cases[] = {
+        {"fe80::1", "fe800000000000000000000000000001"},
+        {"::1", "00000000000000000000000000000001"},
+        {"2001:db8::8:800:200c:417a", "20010db8000000000008080020 0c417a"},
+        {"1:2:3:4:5:6:7:8", "00010002000300040005000600070008"},
+        {"fd00::", "fd000000000000000000000000000000"},
+    };
+    for (auto &c : cases) {
+        std::string want(c.bytes);
+        want.erase(std::remove(want.begin(), want.end(), ' '), want.end());
+        ASSERT_EQ(ipv6_text_to_bytes(b, c.text), 0) << c.text;
+        EXPECT_EQ(hex(b), want) << c.text;
+    }
+    // Groups that would land outside the 16 bytes.
+    EXPECT_EQ(ipv6_text_to_bytes(b, "1:2:3:4:5:6:7:8:9"), -1);
+    EXPECT_EQ(ipv6_text_to_bytes(b, "::1:2:3:4:5:6:7:8:9"), -1);
+    EXPECT_EQ(ipv6_text_to_bytes(b, "::"), -1);
+    EXPECT_EQ(ipv6_text_to_bytes(b, nullptr), -1);
+}
+
+TEST_F(UtilsTest, Ipv6LinkLocal)
+{
+    EXPECT_EQ(is_ipv6_link_local("fe80::1"), 1);
+    EXPECT_EQ(is_ipv6_link_local("febf::1"), 1);
+    EXPECT_EQ(is_ipv6_link_local("fe80:1::1"), 0);
+    EXPECT_EQ(is_ipv6_link_local("fec0::1"), 0);
+    EXPECT_EQ(is_ipv6_link_local("::1"), 0);
+    EXPECT_EQ(is_ipv6_link_local("2001:db8::1"), 0);
+    EXPECT_EQ(is_ipv6_link_local("1:2:3:4:5:6:7:8:9"), -1);
+}
+
+}  // namespace
