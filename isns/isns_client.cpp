@@ -9,6 +9,7 @@
 
 #include "common/korvadm_err.h"
 #include "common/korvadm_log.h"
+#include "isns/isns_internal.h"
 #include "isns/isns_pdu.h"
 #include "isns/isns_transport.h"
 
@@ -181,7 +182,11 @@ int query_entity(const char *name)
     emit_iscsi_node_type(ISNS_NODE_TYPE_TARGET);
     emit_delimiter();
     emit_attr(ISNS_TAG_ISCSI_NAME, nullptr);
-    const int r = send_and_recv();
+    return _isns_query_result(send_and_recv());
+}
+
+int _isns_query_result(int r)
+{
     if (r < 0)
         return isns_last_status != 0 ? -2 : -1;
     if (!walk_attrs(isns_pdu_buf, 4, static_cast<size_t>(r), [](const attr &) { return true; })) {
@@ -195,7 +200,13 @@ int isns_check_registration(const char *name)
 {
     if (!name)
         return -1;
-    const int r = query_entity(name);
+    return _isns_check_result(name, query_entity(name));
+}
+
+int _isns_check_result(const char *name, int r)
+{
+    if (!name)
+        return -1;
     if (r < 0) {
         if (r == -2 && (isns_last_status == 6 || isns_last_status == 7))
             return 0;

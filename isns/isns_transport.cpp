@@ -13,6 +13,7 @@
 #include <unistd.h>
 
 #include "common/korvadm_log.h"
+#include "isns/isns_internal.h"
 #include "isns/isns_pdu.h"
 
 char isns_server_addr[256];
@@ -312,6 +313,11 @@ int send_and_recv(void)
     if (isns_trace)
         printf("received %d payload bytes\n", n);
     sock.reset();
+    return _isns_response_status(n);
+}
+
+int _isns_response_status(int n)
+{
     if (n < 4) {
         DBG(1, "no valid response from iSNS server %s", isns_server_addr);
         return -1;
