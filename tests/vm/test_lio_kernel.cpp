@@ -1,0 +1,733 @@
+// The LIO driver against the real kernel target, inside the test VM
+// (scripts/vm/run boots it; tests/vm/lio_kernel.sh runs this binary there).
+// The VM has configfs and the target modules' dependencies preloaded and the
+// three target modules in /usr/local/modules/driver; nothing else. Each suite
+// leaves the driver stopped, so the order of the suites does not matter.
+#include <arpa/inet.h>
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <cstring>
+#include <dirent.h>
+#include <fcntl.h>
+#include <fstream>
+#include <memory>
+#include <sstream>
+#include <string>
+#include <vector>
+
+#include "common/korvadm_err.h"
+#include "common/korvadm_sys.h"
+#include "kernel/korvadm_mod.h"
+#include "kernel/korvadm_mod_lio4.h"
+
+namespace {
+
+const std::string kConfigfs = "/sys/kernel/config";
+const std::string kIscsi = "/sys/kernel/config/target/iscsi";
+const std::string kCore = "/sys/kernel/config/target/core";
+const char *const kModules[] = {"target_core_mod", "target_core_file", "iscsi_target_mod"};
+
+// ---- the kernel as seen by hand, independent of the driver ----
+
+bool exists(const std::string &path)
+{
+    struct stat st;
+    return ::lstat(path.c_str(), &st) == 0;
+}
+
+ino_t inode_of(const std::string &path)
+{
+    struct stat st;
+    return ::lstat(path.c_str(), &st) == 0 ? st.st_ino : 0;
+}
+
+// The attribute's text as the kernel gives it (line end included).
+std::string slurp(const std::string &path)
+{
+    std::ifstream in(path);
+    if (!in)
+        return "<unreadable: " + path + ">";
+    std::ostringstream s;
+    s << in.rdbuf();
+    return s.str();
+}
+
+// A value written the way an operator would: 0 or the kernel's errno.
+int poke(const std::string &path, const std::string &value)
+{
+    int fd = ::open(path.c_str(), O_WRONLY);
+    if (fd < 0)
+        return errno;
+    int err = ::write(fd, value.data(), value.size()) == static_cast<ssize_t>(value.size()) ? 0 : errno;
+    ::close(fd);
+    return err;
+}
+
+int make_dir(const std::string &path)
+{
+    return ::mkdir(path.c_str(), 0700) == 0 ? 0 : errno;
+}
+
+std::vector<std::string> subdirs(const std::string &dir)
+{
+    std::vector<std::string> names;
+    if (DIR *d = ::opendir(dir.c_str())) {
+        while (dirent *e = ::readdir(d)) {
+            std::string name = e->d_name;
+            struct stat st;
+            if (name != "." && name != ".." && ::lstat((dir + "/" + name).c_str(), &st) == 0 &&
+                S_ISDIR(st.st_mode))
+                names.push_back(name);
+        }
+        ::closedir(d);
+    }
+    std::sort(names.begin(), names.end());
+    return names;
+}
+
+bool module_loaded(const std::string &name)
+{
+    std::ifstream in("/proc/modules");
+    std::string line;
+    while (std::getline(in, line))
+        if (line.compare(0, name.size() + 1, name + " ") == 0)
+            return true;
+    return false;
+}
+
+std::vector<std::string> loaded_target_modules()
+{
+    std::vector<std::string> loaded;
+    for (const char *m : kModules)
+        if (module_loaded(m))
+            loaded.push_back(m);
+    return loaded;
+}
+
+bool configfs_mounted()
+{
+    std::ifstream in("/proc/mounts");
+    std::string dev, dir, type;
+    std::string rest;
+    while (in >> dev >> dir >> type && std::getline(in, rest))
+        if (dir == kConfigfs && type == "configfs")
+            return true;
+    return false;
+}
+
+// A listening TCP socket on port, from /proc/net/tcp or tcp6.
+bool kernel_listens(int port, bool ipv6)
+{
+    std::ifstream in(ipv6 ? "/proc/net/tcp6" : "/proc/net/tcp");
+    std::string line;
+    char want[8];
+    std::snprintf(want, sizeof want, ":%04X", port);
+    std::getline(in, line);
+    while (std::getline(in, line)) {
+        std::istringstream f(line);
+        std::string slot, local, remote, state;
+        f >> slot >> local >> remote >> state;
+        if (state == "0A" && local.size() > 5 && local.compare(local.size() - 5, 5, want) == 0)
+            return true;
+    }
+    return false;
+}
+
+// The automatic fe80:: address of an interface, from /proc/net/if_inet6.
+std::string link_local_of(const std::string &ifname)
+{
+    std::ifstream in("/proc/net/if_inet6");
+    std::string hex, index, plen, scope, flags, name;
+    while (in >> hex >> index >> plen >> scope >> flags >> name) {
+        if (name != ifname || hex.compare(0, 4, "fe80") != 0 || hex.size() != 32)
+            continue;
+        unsigned char bytes[16];
+        for (int i = 0; i < 16; i++)
+            bytes[i] = static_cast<unsigned char>(std::stoi(hex.substr(2 * i, 2), nullptr, 16));
+        char text[INET6_ADDRSTRLEN];
+        if (inet_ntop(AF_INET6, bytes, text, sizeof text))
+            return text;
+    }
+    return "";
+}
+
+// ---- the driver's records ----
+
+struct TargetFree {
+    void operator()(iscsi_target_t *t) const { iscsi_target_free(t); }
+};
+using Target = std::unique_ptr<iscsi_target_t, TargetFree>;
+
+Target make_target(const std::string &iqn, int tpgt, const std::string &alias = "vm alias")
+{
+    Target t(iscsi_target_new());
+    if (t) {
+        std::snprintf(t->iqn, sizeof t->iqn, "%s", iqn.c_str());
+        std::snprintf(t->alias, sizeof t->alias, "%s", alias.c_str());
+        t->tpgt = tpgt;
+        t->dataout_timeout = 5;
+    }
+    return t;
+}
+
+void want_portal(iscsi_target_t *t, const std::string &ipv4, const std::string &ipv6, int port,
+                 const std::string &dev = "")
+{
+    iscsi_ip_t *ip = iscsi_ip_new();
+    ASSERT_NE(ip, nullptr);
+    std::snprintf(ip->ipv4, sizeof ip->ipv4, "%s", ipv4.c_str());
+    std::snprintf(ip->ipv6, sizeof ip->ipv6, "%s", ipv6.c_str());
+    std::snprintf(ip->dev_name, sizeof ip->dev_name, "%s", dev.c_str());
+    ip->port = port;
+    list_append(&ip->node, &t->ip_list);
+}
+
+void clear_wanted(iscsi_target_t *t) { iscsi_ip_free_list(&t->ip_list); }
+
+std::string tpg_dir(const iscsi_target_t *t)
+{
+    return kIscsi + "/" + t->iqn + "/tpgt_" + std::to_string(t->tpgt);
+}
+
+// What lio3_get_target_existing_ip_list reports, one "ipv4|ipv6|port|dev" a portal.
+std::vector<std::string> reported_portals(iscsi_target_t *t, int *rc)
+{
+    list_t got;
+    list_init(&got);
+    *rc = lio3_get_target_existing_ip_list(&got, t);
+    std::vector<std::string> out;
+    for (iscsi_ip_t *ip : korv::list_records<iscsi_ip_t>(&got))
+        out.push_back(std::string(ip->ipv4) + "|" + ip->ipv6 + "|" + std::to_string(ip->port) + "|" +
+                      ip->dev_name);
+    iscsi_ip_free_list(&got);
+    std::sort(out.begin(), out.end());
+    return out;
+}
+
+// A fileio backstore made by hand (the backstore operations are not this
+// suite's subject), mapped as LUN 0 of the portal group.
+void hand_made_lun(const std::string &tpg, const std::string &name)
+{
+    const std::string dev = kCore + "/fileio_0/" + name;
+    ASSERT_EQ(::system(("mkdir -p '" + dev + "'").c_str()), 0);
+    ASSERT_EQ(poke(dev + "/control", "fd_dev_name=/tmp/" + name + ".img,fd_dev_size=1048576"), 0);
+    ASSERT_EQ(poke(dev + "/enable", "1"), 0);
+    ASSERT_EQ(make_dir(tpg + "/lun/lun_0"), 0);
+    ASSERT_EQ(::symlink(dev.c_str(), (tpg + "/lun/lun_0/" + name).c_str()), 0);
+}
+
+// An ACL made by hand, with the portal group's LUN 0 mapped into it when mapped.
+void hand_made_acl(const std::string &tpg, const std::string &initiator, bool mapped = false)
+{
+    const std::string acl = tpg + "/acls/" + initiator;
+    ASSERT_EQ(make_dir(acl), 0);
+    if (mapped) {
+        ASSERT_EQ(make_dir(acl + "/lun_0"), 0);
+        ASSERT_EQ(::symlink((tpg + "/lun/lun_0").c_str(), (acl + "/lun_0/lun_0").c_str()), 0);
+    }
+}
+
+// Removes the ACLs and LUNs of a portal group the way the kernel accepts:
+// mapping links, then the mapped-LUN and ACL directories, then each LUN's
+// backstore link and directory. Returns whether nothing is left.
+bool unmake_acls_and_luns(const std::string &tpg)
+{
+    for (const std::string &acl : subdirs(tpg + "/acls")) {
+        const std::string a = tpg + "/acls/" + acl;
+        for (const std::string &mapped : subdirs(a)) {
+            if (mapped.rfind("lun_", 0) != 0)
+                continue;
+            ::unlink((a + "/" + mapped + "/" + mapped).c_str());
+            ::rmdir((a + "/" + mapped).c_str());
+        }
+        ::rmdir(a.c_str());
+    }
+    for (const std::string &lun : subdirs(tpg + "/lun")) {
+        const std::string l = tpg + "/lun/" + lun;
+        if (DIR *d = ::opendir(l.c_str())) {
+            std::vector<std::string> links;
+            while (dirent *e = ::readdir(d))
+                if (e->d_type == DT_LNK)
+                    links.push_back(l + "/" + e->d_name);
+            ::closedir(d);
+            for (const std::string &link : links)
+                ::unlink(link.c_str());
+        }
+        ::rmdir(l.c_str());
+    }
+    return subdirs(tpg + "/acls").empty() && subdirs(tpg + "/lun").empty();
+}
+
+// Leaves the machine with no target module loaded and nothing in configfs,
+// whatever a test left behind: the driver's stop, after removing by hand
+// what its stop cannot (see StopIsRefusedWhileAnAclRemains).
+void force_stopped()
+{
+    for (const std::string &iqn : subdirs(kIscsi))
+        for (const std::string &tpg : subdirs(kIscsi + "/" + iqn))
+            if (tpg.rfind("tpgt_", 0) == 0)
+                unmake_acls_and_luns(kIscsi + "/" + iqn + "/" + tpg);
+    if (lio3_stop_module() == 0 && loaded_target_modules().empty())
+        return;
+    ADD_FAILURE() << "the driver's stop left modules behind; removing them by hand";
+    ::system("cd /sys/kernel/config/target 2>/dev/null && {"
+             " rmdir iscsi/*/tpgt_*/np/* iscsi/*/tpgt_* iscsi/* core/fileio_*/* core/fileio_* iscsi; } 2>/dev/null;"
+             " rmmod iscsi_target_mod; rmmod target_core_file; rmmod target_core_mod");
+    if (!configfs_mounted())
+        ::system("mount -t configfs configfs /sys/kernel/config");
+}
+
+// ---- starting and stopping the driver ----
+
+class LioModules : public ::testing::Test {
+protected:
+    void SetUp() override { ASSERT_EQ(iscsi_mod_select(ISCSI_MOD_TYPE_LIO), 0); }
+    void TearDown() override { force_stopped(); }
+};
+
+TEST_F(LioModules, StartInsertsTheModulesAndMakesTheDirectories)
+{
+    ASSERT_TRUE(loaded_target_modules().empty());
+    EXPECT_EQ(iscsi_mod_get_state(), 1);
+    EXPECT_FALSE(exists(kIscsi)); // the kernel makes it only on the first mkdir
+
+    ASSERT_EQ(iscsi_mod_start(), 0);
+
+    EXPECT_EQ(loaded_target_modules(), std::vector<std::string>(std::begin(kModules), std::end(kModules)));
+    EXPECT_TRUE(exists(kIscsi + "/lio_version")) << "the fabric directory the kernel populates";
+    EXPECT_TRUE(exists("/var/target/pr"));
+    EXPECT_TRUE(exists("/var/target/alua"));
+    EXPECT_EQ(iscsi_mod_get_state(), 0);
+}
+
+TEST_F(LioModules, StopLeavesNoModuleAndConfigfsMounted)
+{
+    ASSERT_EQ(iscsi_mod_start(), 0);
+    ASSERT_EQ(iscsi_mod_stop(), 0);
+    EXPECT_TRUE(loaded_target_modules().empty());
+    EXPECT_EQ(iscsi_mod_get_state(), 1);
+    EXPECT_TRUE(configfs_mounted());
+
+    // Stopping a stopped driver is a no-op, and it starts again afterwards.
+    EXPECT_EQ(iscsi_mod_stop(), 0);
+    ASSERT_EQ(iscsi_mod_start(), 0);
+    EXPECT_EQ(iscsi_mod_get_state(), 0);
+}
+
+TEST_F(LioModules, StopTearsDownTargetsAndBackstoresTheKernelHolds)
+{
+    ASSERT_EQ(iscsi_mod_start(), 0);
+    Target t = make_target("iqn.2026-01.vm:stop-full", 1);
+    ASSERT_EQ(lio3_add_target(t.get()), 0);
+    want_portal(t.get(), "127.0.0.1", "::1", 3260);
+    ASSERT_EQ(lio3_set_target_ip(t.get()), 0);
+    ASSERT_EQ(lio3_enable_target(t.get()), 0);
+    Target second = make_target("iqn.2026-01.vm:stop-second", 2);
+    ASSERT_EQ(lio3_add_target(second.get()), 0);
+    const std::string disk = kCore + "/fileio_3/stopdisk";
+    ASSERT_EQ(::system(("mkdir -p " + disk).c_str()), 0);
+    ASSERT_EQ(poke(disk + "/control", "fd_dev_name=/tmp/stopdisk.img,fd_dev_size=1048576"), 0);
+    ASSERT_EQ(poke(disk + "/enable", "1"), 0);
+    // With configuration present the kernel refuses to unload the modules,
+    // so the driver must have emptied configfs first.
+    ASSERT_NE(::system("rmmod iscsi_target_mod 2>/dev/null"), 0);
+
+    EXPECT_EQ(iscsi_mod_stop(), 0);
+
+    EXPECT_TRUE(loaded_target_modules().empty());
+    EXPECT_FALSE(exists(kIscsi));
+    EXPECT_FALSE(exists(kCore)) << "target_core_mod gone with its tree";
+    EXPECT_FALSE(kernel_listens(3260, false));
+}
+
+TEST_F(LioModules, StopIsRefusedWhileAnAclRemains)
+{
+    // Target deletion removes ACLs with "rm -rf", which configfs refuses
+    // (attribute files cannot be unlinked): the portal group stays, and with
+    // it iscsi_target_mod, which the kernel will not unload while in use.
+    ASSERT_EQ(iscsi_mod_start(), 0);
+    Target t = make_target("iqn.2026-01.vm:stop-acl", 1);
+    ASSERT_EQ(lio3_add_target(t.get()), 0);
+    want_portal(t.get(), "127.0.0.1", "", 3260);
+    ASSERT_EQ(lio3_set_target_ip(t.get()), 0);
+    hand_made_acl(tpg_dir(t.get()), "iqn.2026-01.vm:init-stop");
+
+    EXPECT_EQ(iscsi_mod_stop(), ERR_MODULE_REMOVE);
+    EXPECT_TRUE(module_loaded("iscsi_target_mod"));
+    EXPECT_TRUE(exists(tpg_dir(t.get()) + "/acls/iqn.2026-01.vm:init-stop"));
+    EXPECT_EQ(subdirs(tpg_dir(t.get()) + "/np"), std::vector<std::string>{}) << "portals went first";
+
+    // Once the ACL is gone the same stop succeeds.
+    ASSERT_TRUE(unmake_acls_and_luns(tpg_dir(t.get())));
+    EXPECT_EQ(iscsi_mod_stop(), 0);
+    EXPECT_TRUE(loaded_target_modules().empty());
+}
+
+TEST_F(LioModules, StartMountsConfigfsWhenNothingIsMounted)
+{
+    ASSERT_EQ(::system("umount /sys/kernel/config"), 0);
+    ASSERT_FALSE(configfs_mounted());
+    ASSERT_EQ(iscsi_mod_start(), 0);
+    EXPECT_TRUE(configfs_mounted());
+    EXPECT_EQ(iscsi_mod_get_state(), 0);
+}
+
+TEST_F(LioModules, HalfStartedDriverStopsByRemovingTheModules)
+{
+    // Modules in, but no mkdir under the fabric yet: the kernel has not made
+    // the iscsi directory, which the probe reports as half started.
+    for (const char *m : kModules)
+        ASSERT_EQ(::system(("insmod /usr/local/modules/driver/" + std::string(m) + ".ko").c_str()), 0);
+    ASSERT_FALSE(exists(kIscsi));
+    EXPECT_EQ(iscsi_mod_get_state(), ERR_MODULE_NO_CONFIGFS);
+
+    EXPECT_EQ(iscsi_mod_stop(), 0);
+    EXPECT_TRUE(loaded_target_modules().empty());
+}
+
+TEST_F(LioModules, StartFailsAndRollsBackWhenAModuleIsMissing)
+{
+    ASSERT_EQ(::rename("/usr/local/modules/driver/iscsi_target_mod.ko", "/tmp/iscsi_target_mod.ko"), 0);
+    int rc = iscsi_mod_start();
+    ASSERT_EQ(::rename("/tmp/iscsi_target_mod.ko", "/usr/local/modules/driver/iscsi_target_mod.ko"), 0);
+    EXPECT_EQ(rc, ERR_MODULE_START);
+    EXPECT_TRUE(loaded_target_modules().empty()) << "the two inserted modules are removed again";
+    EXPECT_EQ(iscsi_mod_get_state(), 1);
+}
+
+// ---- targets in a running driver ----
+
+class LioTarget : public ::testing::Test {
+protected:
+    static void SetUpTestSuite()
+    {
+        ASSERT_EQ(iscsi_mod_select(ISCSI_MOD_TYPE_LIO), 0);
+        force_stopped();
+        ASSERT_EQ(iscsi_mod_start(), 0);
+    }
+    static void TearDownTestSuite() { force_stopped(); }
+
+    void SetUp() override
+    {
+        const auto *info = ::testing::UnitTest::GetInstance()->current_test_info();
+        std::string name = info->name();
+        std::transform(name.begin(), name.end(), name.begin(), [](unsigned char c) { return std::tolower(c); });
+        t_ = make_target("iqn.2026-01.vm:" + name, 1);
+        ASSERT_TRUE(t_);
+        tpg_ = tpg_dir(t_.get());
+    }
+    void TearDown() override
+    {
+        if (exists(kIscsi + "/" + t_->iqn)) {
+            // What deletion cannot remove on this kernel (see the test below).
+            unmake_acls_and_luns(tpg_);
+            EXPECT_EQ(lio3_del_target(t_.get()), 0) << "left-over target could not be deleted";
+        }
+    }
+
+    std::string attr(const std::string &rel) const { return slurp(tpg_ + "/" + rel); }
+
+    Target t_;
+    std::string tpg_;
+};
+
+TEST_F(LioTarget, AddCreatesThePortalGroupWithItsDefaults)
+{
+    ASSERT_EQ(lio3_add_target(t_.get()), 0);
+
+    EXPECT_TRUE(exists(tpg_ + "/np"));
+    EXPECT_EQ(attr("attrib/generate_node_acls"), "1\n");
+    EXPECT_EQ(attr("param/MaxConnections"), "8\n");
+    EXPECT_EQ(attr("param/TargetAlias"), "vm alias\n");
+    EXPECT_EQ(attr("attrib/default_cmdsn_depth"), "64\n");
+    EXPECT_EQ(attr("enable"), "0\n") << "added targets stay disabled";
+    EXPECT_TRUE(exists(std::string("/var/target/alua/iSCSI/") + t_->iqn + "+1"));
+    // The data-out time-out goes to acls/default_policy, which this kernel
+    // does not have: the write fails, is ignored, and no ACL appears.
+    EXPECT_EQ(subdirs(tpg_ + "/acls"), std::vector<std::string>{});
+}
+
+TEST_F(LioTarget, AddingAnExistingTargetChangesNothing)
+{
+    ASSERT_EQ(lio3_add_target(t_.get()), 0);
+    ASSERT_EQ(poke(tpg_ + "/param/TargetAlias", "changed by hand"), 0);
+    ASSERT_EQ(poke(tpg_ + "/attrib/generate_node_acls", "0"), 0);
+
+    EXPECT_EQ(lio3_add_target(t_.get()), 0);
+    EXPECT_EQ(attr("param/TargetAlias"), "changed by hand\n");
+    EXPECT_EQ(attr("attrib/generate_node_acls"), "0\n");
+}
+
+TEST_F(LioTarget, TagsTheKernelWouldAcceptAreRefused)
+{
+    t_->tpgt = 64; // the kernel takes tpgt_64 and beyond; the appliance stops at 63
+    EXPECT_EQ(lio3_add_target(t_.get()), ERR_PARAM);
+    EXPECT_FALSE(exists(kIscsi + "/" + t_->iqn));
+    t_->tpgt = 0;
+    EXPECT_EQ(lio3_add_target(t_.get()), 0);
+    EXPECT_TRUE(exists(kIscsi + "/" + t_->iqn + "/tpgt_0"));
+}
+
+TEST_F(LioTarget, AttributePrimitivesAgainstTheKernel)
+{
+    ASSERT_EQ(lio3_add_target(t_.get()), 0);
+    char buf[64] = {};
+    ASSERT_EQ(configfs_read_attr_str((tpg_ + "/param/AuthMethod").c_str(), buf, sizeof buf), 0);
+    EXPECT_STREQ(buf, "CHAP") << "the kernel's line end is stripped";
+    int v = -1;
+    EXPECT_EQ(configfs_read_attr_int((tpg_ + "/attrib/login_timeout").c_str(), &v), 0);
+    EXPECT_EQ(v, 15);
+    EXPECT_EQ(configfs_write_attr_str((tpg_ + "/param/AuthMethod").c_str(), "CHAP,None", 1), 0);
+    EXPECT_EQ(configfs_write_attr_int((tpg_ + "/attrib/login_timeout").c_str(), 20, 1), 0);
+    EXPECT_EQ(attr("attrib/login_timeout"), "20\n");
+
+    // The kernel refuses out-of-range values with and without a line end.
+    EXPECT_EQ(configfs_write_attr_int((tpg_ + "/attrib/generate_node_acls").c_str(), 2, 1), ERR_CONFIGFS);
+    EXPECT_EQ(attr("attrib/generate_node_acls"), "1\n");
+    EXPECT_EQ(configfs_read_attr_str((tpg_ + "/no_such_attr").c_str(), buf, sizeof buf), ERR_CONFIGFS);
+    // Values with shell metacharacters reach the kernel as text.
+    EXPECT_EQ(configfs_write_attr_str((tpg_ + "/param/TargetAlias").c_str(), "a \"b\" $(c) `d`;e", 1), 0);
+    EXPECT_EQ(attr("param/TargetAlias"), "a \"b\" $(c) `d`;e\n");
+}
+
+TEST_F(LioTarget, PortalsOfEveryKindAreCreatedListenedOnAndListed)
+{
+    const std::string ll = link_local_of("dummy0");
+    ASSERT_FALSE(ll.empty()) << "dummy0 has no link-local address";
+    ASSERT_EQ(lio3_add_target(t_.get()), 0);
+    want_portal(t_.get(), "127.0.0.1", "", 3260);
+    want_portal(t_.get(), "", "::1", 3261);
+    want_portal(t_.get(), "", ll, 3262, "dummy0");
+
+    ASSERT_EQ(lio3_set_target_ip(t_.get()), 0);
+
+    EXPECT_EQ(subdirs(tpg_ + "/np"),
+              (std::vector<std::string>{"127.0.0.1:3260", "[::1]:3261", "[" + ll + "%dummy0]:3262"}));
+    EXPECT_TRUE(kernel_listens(3260, false));
+    EXPECT_TRUE(kernel_listens(3261, true));
+    EXPECT_TRUE(kernel_listens(3262, true));
+    int rc = -1;
+    EXPECT_EQ(reported_portals(t_.get(), &rc),
+              (std::vector<std::string>{"127.0.0.1||3260|", "|::1|3261|", "|" + ll + "|3262|dummy0"}));
+    EXPECT_EQ(rc, 0);
+
+    // Through the daemon's entry point too.
+    list_t got;
+    list_init(&got);
+    EXPECT_EQ(iscsi_mod_get_target_ip_list_in_target_parm(&got, t_->iqn, t_->tpgt), 0);
+    EXPECT_EQ(got.count, 3);
+    iscsi_ip_free_list(&got);
+}
+
+TEST_F(LioTarget, ReplacingPortalsDropsTheOldOnes)
+{
+    ASSERT_EQ(lio3_add_target(t_.get()), 0);
+    want_portal(t_.get(), "127.0.0.1", "::1", 3260);
+    ASSERT_EQ(lio3_set_target_ip(t_.get()), 0);
+    ASSERT_EQ(subdirs(tpg_ + "/np"), (std::vector<std::string>{"127.0.0.1:3260", "[::1]:3260"}));
+
+    clear_wanted(t_.get());
+    want_portal(t_.get(), "127.0.0.2", "", 3270);
+    // A portal the kernel refuses (no such host) is skipped, the rest is made.
+    want_portal(t_.get(), "", "not-an-address", 3271);
+    EXPECT_EQ(lio3_set_target_ip(t_.get()), 0);
+    EXPECT_EQ(subdirs(tpg_ + "/np"), std::vector<std::string>{"127.0.0.2:3270"});
+    EXPECT_FALSE(kernel_listens(3260, false)) << "the kernel closed the removed portal";
+}
+
+TEST_F(LioTarget, PortalDiffAddsAndRemovesByAddress)
+{
+    ASSERT_EQ(lio3_add_target(t_.get()), 0);
+    want_portal(t_.get(), "127.0.0.1", "", 3260);
+    want_portal(t_.get(), "", "::1", 3260);
+    ASSERT_EQ(lio3_set_target_ip(t_.get()), 0);
+    const ino_t kept = inode_of(tpg_ + "/np/127.0.0.1:3260");
+
+    // The same list again changes nothing: same directories, same inodes.
+    EXPECT_EQ(lio3_set_target_ip_v2(t_.get()), 0);
+    EXPECT_EQ(subdirs(tpg_ + "/np"), (std::vector<std::string>{"127.0.0.1:3260", "[::1]:3260"}));
+    EXPECT_EQ(inode_of(tpg_ + "/np/127.0.0.1:3260"), kept);
+
+    clear_wanted(t_.get());
+    want_portal(t_.get(), "127.0.0.1", "", 3299); // present by address: port not compared
+    want_portal(t_.get(), "127.0.0.3", "", 3263);
+    EXPECT_EQ(lio3_set_target_ip_v2(t_.get()), 0);
+    EXPECT_EQ(subdirs(tpg_ + "/np"), (std::vector<std::string>{"127.0.0.1:3260", "127.0.0.3:3263"}));
+    EXPECT_EQ(inode_of(tpg_ + "/np/127.0.0.1:3260"), kept);
+    EXPECT_TRUE(kernel_listens(3263, false));
+}
+
+TEST_F(LioTarget, PortalsCanBeRemovedWhileTheTargetIsEnabled)
+{
+    ASSERT_EQ(lio3_add_target(t_.get()), 0);
+    want_portal(t_.get(), "127.0.0.1", "", 3260);
+    ASSERT_EQ(lio3_set_target_ip(t_.get()), 0);
+    ASSERT_EQ(lio3_enable_target(t_.get()), 0);
+    clear_wanted(t_.get());
+    EXPECT_EQ(lio3_set_target_ip_v2(t_.get()), 0);
+    EXPECT_EQ(subdirs(tpg_ + "/np"), std::vector<std::string>{});
+    EXPECT_EQ(attr("enable"), "1\n");
+}
+
+TEST_F(LioTarget, EnableAndDisable)
+{
+    ASSERT_EQ(lio3_add_target(t_.get()), 0);
+    ASSERT_EQ(poke(tpg_ + "/param/AuthMethod", "None"), 0);
+
+    EXPECT_EQ(lio3_enable_target(t_.get()), 0);
+    EXPECT_EQ(attr("enable"), "1\n");
+    EXPECT_EQ(attr("param/AuthMethod"), "CHAP,None\n");
+    EXPECT_EQ(lio3_enable_target(t_.get()), 0) << "already enabled";
+    EXPECT_EQ(attr("enable"), "1\n");
+
+    ASSERT_EQ(poke(tpg_ + "/param/AuthMethod", "None"), 0);
+    EXPECT_EQ(lio3_disable_target(t_.get()), 0);
+    EXPECT_EQ(attr("enable"), "0\n");
+    EXPECT_EQ(attr("param/AuthMethod"), "CHAP,None\n") << "rewritten on disabling too";
+    EXPECT_EQ(lio3_disable_target(t_.get()), 0);
+    EXPECT_EQ(attr("enable"), "0\n");
+}
+
+TEST_F(LioTarget, EnablingATargetMissingFromTheKernelFails)
+{
+    // The enable switch cannot be read, which counts as enabled.
+    EXPECT_EQ(lio3_enable_target(t_.get()), 0);
+    EXPECT_FALSE(exists(kIscsi + "/" + t_->iqn));
+    EXPECT_EQ(lio3_disable_target(t_.get()), ERR_CONFIGFS);
+}
+
+TEST_F(LioTarget, ChapSwitchAndCredentialsReachEveryAcl)
+{
+    ASSERT_EQ(lio3_add_target(t_.get()), 0);
+    hand_made_acl(tpg_, "iqn.2026-01.vm:init-a");
+    hand_made_acl(tpg_, "iqn.2026-01.vm:init-b");
+    t_->chap = 1;
+    std::strcpy(t_->chap_user, "vmuser");
+    std::strcpy(t_->chap_pass, "secret123456"); // 12 characters
+    t_->mutual_chap = 1;
+    std::strcpy(t_->mutual_user, "vmtarget");
+    std::strcpy(t_->mutual_pass, "mutualsecret1234"); // 16 characters
+
+    ASSERT_EQ(lio3_set_target_chap(t_.get()), 0);
+
+    EXPECT_EQ(attr("attrib/authentication"), "1\n");
+    EXPECT_EQ(attr("param/AuthMethod"), "CHAP,None\n");
+    for (const char *acl : {"iqn.2026-01.vm:init-a", "iqn.2026-01.vm:init-b"}) {
+        const std::string auth = std::string("acls/") + acl + "/auth/";
+        EXPECT_EQ(attr(auth + "userid"), "vmuser\n") << acl;
+        EXPECT_EQ(attr(auth + "password"), "secret123456\n") << acl;
+        EXPECT_EQ(attr(auth + "userid_mutual"), "vmtarget\n") << acl;
+        EXPECT_EQ(attr(auth + "password_mutual"), "mutualsecret1234\n") << acl;
+    }
+
+    // Off: the switch drops, the credentials stay.
+    t_->chap = 0;
+    EXPECT_EQ(lio3_set_target_chap(t_.get()), 0);
+    EXPECT_EQ(attr("attrib/authentication"), "0\n");
+    EXPECT_EQ(attr("acls/iqn.2026-01.vm:init-a/auth/userid"), "vmuser\n");
+}
+
+TEST_F(LioTarget, InvalidChapSettingsChangeNothing)
+{
+    ASSERT_EQ(lio3_add_target(t_.get()), 0);
+    hand_made_acl(tpg_, "iqn.2026-01.vm:init-c");
+    const std::string before = attr("attrib/authentication");
+    const std::string user_before = attr("acls/iqn.2026-01.vm:init-c/auth/userid");
+    t_->chap = 1;
+    std::strcpy(t_->chap_user, "vmuser");
+    std::strcpy(t_->chap_pass, "short123456"); // 11 characters
+    EXPECT_EQ(lio3_set_target_chap(t_.get()), ERR_PARAM);
+    EXPECT_EQ(attr("attrib/authentication"), before);
+    EXPECT_EQ(attr("acls/iqn.2026-01.vm:init-c/auth/userid"), user_before);
+}
+
+TEST_F(LioTarget, DataoutTimeoutGoesToEveryAclWithinTheKernelsRange)
+{
+    ASSERT_EQ(lio3_add_target(t_.get()), 0);
+    hand_made_acl(tpg_, "iqn.2026-01.vm:init-d");
+    hand_made_acl(tpg_, "iqn.2026-01.vm:init-e");
+    ASSERT_EQ(attr("acls/iqn.2026-01.vm:init-d/attrib/dataout_timeout"), "3\n");
+
+    EXPECT_EQ(lio3_set_target_attr_dataout_timeout(7, t_.get()), 0);
+    EXPECT_EQ(attr("acls/iqn.2026-01.vm:init-d/attrib/dataout_timeout"), "7\n");
+    EXPECT_EQ(attr("acls/iqn.2026-01.vm:init-e/attrib/dataout_timeout"), "7\n");
+
+    // This kernel takes 2..60 seconds; outside that it refuses the write,
+    // which the driver logs per ACL while still answering 0.
+    EXPECT_EQ(lio3_set_target_attr_dataout_timeout(61, t_.get()), 0);
+    EXPECT_EQ(attr("acls/iqn.2026-01.vm:init-d/attrib/dataout_timeout"), "7\n");
+    EXPECT_EQ(lio3_set_target_attr_dataout_timeout(0, t_.get()), 0);
+    EXPECT_EQ(attr("acls/iqn.2026-01.vm:init-e/attrib/dataout_timeout"), "7\n");
+}
+
+TEST_F(LioTarget, DataoutTimeoutOfATargetNotInTheKernel)
+{
+    EXPECT_EQ(lio3_set_target_attr_dataout_timeout(7, t_.get()), ERR_TARGET_NOT_IN_KERNEL);
+}
+
+TEST_F(LioTarget, DeleteTearsDownAnEnabledTargetWithItsPortals)
+{
+    ASSERT_EQ(lio3_add_target(t_.get()), 0);
+    want_portal(t_.get(), "127.0.0.1", "::1", 3260);
+    ASSERT_EQ(lio3_set_target_ip(t_.get()), 0);
+    ASSERT_EQ(lio3_enable_target(t_.get()), 0);
+    // The kernel refuses to drop the group while anything is in it.
+    ASSERT_EQ(::rmdir(tpg_.c_str()), -1);
+
+    EXPECT_EQ(lio3_del_target(t_.get()), 0);
+
+    EXPECT_FALSE(exists(kIscsi + "/" + t_->iqn));
+    EXPECT_FALSE(kernel_listens(3260, false));
+    EXPECT_TRUE(exists(std::string("/var/target/alua/iSCSI/") + t_->iqn + "+1")) << "left in place";
+    EXPECT_EQ(lio3_del_target(t_.get()), 0) << "already removed";
+}
+
+TEST_F(LioTarget, DeleteWithAclsAndLunsIsRefusedByTheKernel)
+{
+    // ACLs and LUNs are removed with "rm -rf", which configfs answers with
+    // EPERM on their attribute files and so leaves whole; the portal group
+    // then cannot be removed. Disabling and the portals are done by then.
+    ASSERT_EQ(lio3_add_target(t_.get()), 0);
+    want_portal(t_.get(), "127.0.0.1", "", 3260);
+    ASSERT_EQ(lio3_set_target_ip(t_.get()), 0);
+    hand_made_lun(tpg_, "deldisk");
+    hand_made_acl(tpg_, "iqn.2026-01.vm:init-f", true);
+    hand_made_acl(tpg_, "iqn.2026-01.vm:init-g");
+    ASSERT_EQ(lio3_enable_target(t_.get()), 0);
+
+    EXPECT_EQ(lio3_del_target(t_.get()), ERR_CONFIGFS);
+
+    EXPECT_EQ(attr("enable"), "0\n");
+    EXPECT_EQ(subdirs(tpg_ + "/np"), std::vector<std::string>{});
+    EXPECT_EQ(subdirs(tpg_ + "/acls"), (std::vector<std::string>{"iqn.2026-01.vm:init-f", "iqn.2026-01.vm:init-g"}));
+    EXPECT_EQ(subdirs(tpg_ + "/lun"), std::vector<std::string>{"lun_0"});
+
+    // Explicit removal in the kernel's order clears the way; deletion then works.
+    ASSERT_TRUE(unmake_acls_and_luns(tpg_));
+    EXPECT_EQ(lio3_del_target(t_.get()), 0);
+    EXPECT_FALSE(exists(kIscsi + "/" + t_->iqn));
+    EXPECT_TRUE(exists(kCore + "/fileio_0/deldisk")) << "backstores outlive their targets";
+    EXPECT_EQ(::rmdir((kCore + "/fileio_0/deldisk").c_str()), 0);
+    EXPECT_EQ(::rmdir((kCore + "/fileio_0").c_str()), 0);
+}
+
+TEST_F(LioTarget, RecursiveRemovalIsRefusedByConfigfs)
+{
+    // configfs attribute files cannot be unlinked, so "rm -rf" fails part-way:
+    // the driver reports the failure and the kernel keeps the whole target.
+    ASSERT_EQ(lio3_add_target(t_.get()), 0);
+    want_portal(t_.get(), "127.0.0.1", "", 3260);
+    ASSERT_EQ(lio3_set_target_ip(t_.get()), 0);
+
+    EXPECT_EQ(configfs_rmdir_recursive((kIscsi + "/" + t_->iqn).c_str()), ERR_SHELL);
+    EXPECT_TRUE(exists(tpg_ + "/enable"));
+    EXPECT_EQ(subdirs(tpg_ + "/np"), std::vector<std::string>{"127.0.0.1:3260"});
+    // A plain rmdir of a non-empty group fails just the same.
+    EXPECT_EQ(configfs_rmdir(tpg_.c_str()), ERR_SHELL);
+}
+
+} // namespace
