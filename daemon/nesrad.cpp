@@ -1,12 +1,511 @@
-// nesrad: the iSNS client daemon. Placeholder until the main loop lands.
-#include "common/korvadm_log.h"
+// nesrad: the iSNS client daemon (start-up, main loop, node list, registration).
+#include "daemon/nesrad.h"
 
-int main(int argc, char **argv)
+#include <arpa/inet.h>
+#include <netdb.h>
+#include <poll.h>
+#include <signal.h>
+#include <sys/socket.h>
+#include <time.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <new>
+#include <string_view>
+
+#include "common/korvadm_debug.h"
+#include "common/korvadm_err.h"
+#include "common/korvadm_log.h"
+#include "common/korvadm_sys.h"
+#include "common/korvadm_utils.h"
+#include "isns/isns_transport.h"
+#include "kernel/korvadm_mod.h"
+
+namespace {
+
+constexpr size_t kMaxHostArg = 255;
+
+// Process-wide state of the daemon (one instance).
+char g_server_host[256];
+volatile sig_atomic_t g_pending_event = -1;  // last signal received, -1: none
+unsigned g_poll_interval = NESRAD_POLL_INTERVAL;
+int g_registered;
+nesrad_node_t *g_iqn_head;
+
+// Copies src into dst[size] bounded, always NUL-terminated.
+void copy_bounded(char *dst, size_t size, const char *src)
 {
-    if (argc != 2 || !argv[1][0]) {
-        DBG(0, "usage: nesrad <iSNS server>");
+    std::snprintf(dst, size, "%s", src ? src : "");
+}
+
+}  // namespace
+
+iscsi_conf_ctx_t g_nesrad_conf;
+
+/* ==== registered node list ==== */
+
+int conv_str(char *s)
+{
+    return conv_iqn_str(s, 1);
+}
+
+void _iqn_add(const char *iqn, int tpgt)
+{
+    if (!iqn) {
+        DBG(0, "iqn is NULL");
+        return;
+    }
+    auto *rec = new (std::nothrow) nesrad_node_t{};
+    if (!rec) {
+        DBG(0, "Core_SARecord_Add alloc memory fail");
+        return;
+    }
+    copy_bounded(rec->iqn, sizeof rec->iqn, iqn);
+    rec->tpgt = tpgt;
+    nesrad_node_t **tail = &g_iqn_head;
+    while (*tail)
+        tail = &(*tail)->next;
+    *tail = rec;
+    DBG(1, "add %s:%d", rec->iqn, tpgt);
+}
+
+void _iqn_del(const char *iqn)
+{
+    if (!iqn) {
+        DBG(0, "iqn is NULL");
+        return;
+    }
+    for (nesrad_node_t **link = &g_iqn_head; *link; link = &(*link)->next) {
+        nesrad_node_t *rec = *link;
+        if (std::strcmp(rec->iqn, iqn) == 0) {
+            *link = rec->next;
+            DBG(1, "del %s", iqn);
+            delete rec;
+            return;
+        }
+    }
+}
+
+int _iqn_query(const char *iqn)
+{
+    if (!iqn) {
+        DBG(0, "iqn is NULL");
+        return -1;
+    }
+    for (const nesrad_node_t *rec = g_iqn_head; rec; rec = rec->next)
+        if (std::strcmp(rec->iqn, iqn) == 0)
+            return 0;
+    return -1;
+}
+
+int _iqn_next(const char *iqn, nesrad_node_t **out)
+{
+    if (!out)
+        return -1;
+    if (!iqn) {
+        *out = g_iqn_head;
+        return g_iqn_head ? 0 : -1;
+    }
+    for (nesrad_node_t *rec = g_iqn_head; rec; rec = rec->next) {
+        if (std::strcmp(rec->iqn, iqn) == 0) {
+            *out = rec->next;
+            return 0;
+        }
+    }
+    return -1;
+}
+
+int _iqn_clear(void)
+{
+    nesrad_node_t *head = nullptr;
+    while (_iqn_next(nullptr, &head) == 0 && head) {
+        // Copy the key: _iqn_del frees the record it names.
+        char iqn[sizeof head->iqn];
+        copy_bounded(iqn, sizeof iqn, head->iqn);
+        _iqn_del(iqn);
+    }
+    return 0;
+}
+
+int init_iqn_list(void)
+{
+    // A refreshed host name, so that a reload after a rename registers under
+    // the new entity identifier.
+    char host[128] = {};
+    if (sys_net_get_host_name(host, sizeof host, 1) == 0) {
+        conv_str(host);
+        copy_bounded(isns_entity_id, sizeof isns_entity_id, host);
+    }
+
+    list_t targets;
+    list_init(&targets);
+    struct Release {
+        list_t *l;
+        ~Release() { target_conf_free_list(l); }
+    } release{&targets};
+
+    const iscsi_conf_ops_t *ops = g_nesrad_conf.ops;
+    if (!ops || !ops->xmldb_get_all_target_conf_lite ||
+        ops->xmldb_get_all_target_conf_lite(&targets) != 0) {
+        DBG(0, "get target conf from config failed");
+        return -1;
+    }
+    int count = 0;
+    for (target_conf_t *t : korv::list_records<target_conf_t>(&targets)) {
+        if (iscsi_conf_generate_iqn(t->iqn, isns_entity_id, t->name) < 1) {
+            DBG(0, "can not get IQN");
+            return -1;
+        }
+        ++count;
+        _iqn_add(t->iqn, t->tpgt);
+    }
+    return count;
+}
+
+/* ==== registration ==== */
+
+int ipv4_text_to_bytes(unsigned char out[16], const char *text)
+{
+    if (!out || !text)
+        return -1;
+    std::string_view rest(text);
+    if (std::count(rest.begin(), rest.end(), '.') != 3)
+        return -1;
+    std::memset(out, 0, 16);
+    out[10] = out[11] = 0xFF;
+    for (int i = 0; i < 4; ++i) {
+        size_t dot = rest.find('.');
+        std::string_view part = rest.substr(0, dot);
+        // atoi's reading (leading digits, anything after ignored) without
+        // its overflow: the kernel validated the address long before.
+        unsigned long v = 0;
+        for (char c : part) {
+            if (c < '0' || c > '9')
+                break;
+            v = (v * 10 + static_cast<unsigned>(c - '0')) & 0xFFFFu;
+        }
+        out[12 + i] = static_cast<unsigned char>(v);
+        rest = dot == std::string_view::npos ? std::string_view() : rest.substr(dot + 1);
+    }
+    return 0;
+}
+
+namespace {
+
+// Adds one portal of the given address text; false when it could not be
+// made (the caller decides whether that ends the whole address entry).
+enum class portal_rc { added, no_memory, bad_text };
+
+portal_rc add_portal(isns_iscsi_node *node, const char *text, int port, bool v6)
+{
+    isns_ip_portal *portal = isns_ip_portal_new();
+    if (!portal) {
+        DBG(0, "new isns_ip_portal failed");
+        return portal_rc::no_memory;
+    }
+    int rc = v6 ? ipv6_text_to_bytes(portal->address, text)
+                : ipv4_text_to_bytes(portal->address, text);
+    if (rc != 0) {
+        isns_ip_portal_free(portal);
+        return portal_rc::bad_text;
+    }
+    portal->port = static_cast<uint32_t>(port);
+    isns_iscsi_node_add_portal(node, portal);
+    return portal_rc::added;
+}
+
+struct node_ptr {
+    isns_iscsi_node *p = isns_iscsi_node_new();
+    ~node_ptr() { isns_iscsi_node_free(p); }
+};
+
+}  // namespace
+
+int get_iscsi_node_from_mod(isns_iscsi_node *node, const char *iqn, int tpgt)
+{
+    if (!node || !iqn || tpgt < 0)
+        return -1;
+    copy_bounded(node->name, sizeof node->name, iqn);
+    node->pg_tag = static_cast<uint32_t>(tpgt);
+
+    list_t ips;
+    list_init(&ips);
+    struct Release {
+        list_t *l;
+        ~Release() { iscsi_ip_free_list(l); }
+    } release{&ips};
+
+    if (iscsi_mod_get_target_ip_list_in_target_parm(&ips, iqn, tpgt) != 0) {
+        DBG(0, "can not get target ip");
+        return -1;
+    }
+    for (iscsi_ip_t *ip : korv::list_records<iscsi_ip_t>(&ips)) {
+        // A failed IPv4 half drops the whole entry, its IPv6 half included.
+        if (ip->ipv4[0] && add_portal(node, ip->ipv4, ip->port, false) != portal_rc::added)
+            continue;
+        if (ip->ipv6[0])
+            add_portal(node, ip->ipv6, ip->port, true);
+    }
+    return 0;
+}
+
+int target_register_entity_identifier(const char *iqn, int tpgt)
+{
+    DBG(1, "register entity=%s", iqn ? iqn : "");
+    node_ptr node;
+    if (get_iscsi_node_from_mod(node.p, iqn, tpgt) != 0)
+        return -1;
+    copy_bounded(isns_entity_name, sizeof isns_entity_name, iqn);
+    register_entity(node.p);
+    return 0;
+}
+
+int target_register_iSNS_single(const char *iqn, int tpgt)
+{
+    DBG(1, "write tpginfo: iqn=%s", iqn ? iqn : "");
+    node_ptr node;
+    if (get_iscsi_node_from_mod(node.p, iqn, tpgt) != 0)
+        return -1;
+    DBG(1, "register iqn=%s", iqn);
+    register_node(node.p);
+    return 0;
+}
+
+int target_register_iSNS_all(void)
+{
+    nesrad_node_t *rec = nullptr;
+    if (_iqn_next(nullptr, &rec) != 0 || !rec) {
+        DBG(1, "there is no iSCSI target");
+        return -1;
+    }
+    target_register_entity_identifier(rec->iqn, rec->tpgt);
+    for (rec = rec->next; rec; rec = rec->next)
+        target_register_iSNS_single(rec->iqn, rec->tpgt);
+    return 0;
+}
+
+int target_deregister_entity_identifier(void)
+{
+    DBG(1, "deregister entity=%s", isns_entity_name);
+    deregister_entity(isns_entity_name);
+    std::memset(isns_entity_name, 0, sizeof isns_entity_name);
+    return 0;
+}
+
+/* ==== entry and main loop ==== */
+
+int write_pid(int on)
+{
+    const iscsi_conf_ops_t *ops = g_nesrad_conf.ops;
+    int rc = ERR_PARAM;
+    if (ops && ops->xmldb_set_nesrad_pid)
+        rc = ops->xmldb_set_nesrad_pid(on ? static_cast<int>(getpid()) : 0);
+    if (rc != 0)
+        DBG(0, "Failed to write nesrad pid!");
+    return rc;
+}
+
+namespace {
+
+void on_signal(int sig)
+{
+    g_pending_event = sig;
+}
+
+timespec mono_now()
+{
+    timespec ts{};
+    clock_gettime(CLOCK_MONOTONIC, &ts);
+    return ts;
+}
+
+// Waits one poll interval with our signals open. Returns false as soon as
+// one of them arrives. Outside this wait they stay blocked, so a signal sent
+// during an exchange is held and delivered here at once, never lost.
+bool wait_interval(const sigset_t *open_mask)
+{
+    timespec deadline = mono_now();
+    deadline.tv_sec += g_poll_interval;
+    while (g_pending_event == -1) {
+        timespec now = mono_now();
+        timespec left{deadline.tv_sec - now.tv_sec, deadline.tv_nsec - now.tv_nsec};
+        if (left.tv_nsec < 0) {
+            left.tv_nsec += 1000000000L;
+            --left.tv_sec;
+        }
+        if (left.tv_sec < 0)
+            return true;
+        ppoll(nullptr, 0, &left, open_mask);
+    }
+    return false;
+}
+
+// Resolves the server once into the transport's address globals.
+// 0, or the exit status 1 after printing why.
+int resolve_server(const char *host)
+{
+    addrinfo hints{};
+    hints.ai_family = AF_UNSPEC;
+    hints.ai_socktype = SOCK_STREAM;
+    addrinfo *res = nullptr;
+    int rc = getaddrinfo(host, nullptr, &hints, &res);
+    if (rc != 0 || !res) {
+        DBG(1, "getaddrinfo return %s\n", gai_strerror(rc));
+        if (res)
+            freeaddrinfo(res);
         return 1;
     }
-    DBG(0, "not yet implemented");
-    return 1;
+    // Only the first answer counts, whatever the other families offer.
+    sockaddr_storage addr{};
+    int family = res->ai_family;
+    std::memcpy(&addr, res->ai_addr,
+                res->ai_addrlen < sizeof addr ? res->ai_addrlen : sizeof addr);
+    freeaddrinfo(res);
+
+    std::memset(isns_server_addr, 0, sizeof isns_server_addr);
+    const void *raw = nullptr;
+    if (family == AF_INET)
+        raw = &reinterpret_cast<sockaddr_in *>(&addr)->sin_addr;
+    else if (family == AF_INET6)
+        raw = &reinterpret_cast<sockaddr_in6 *>(&addr)->sin6_addr;
+    else {
+        DBG(0, "get ip address failed");
+        return 1;
+    }
+    if (!inet_ntop(family, raw, isns_server_addr, sizeof isns_server_addr)) {
+        std::puts("get address failed");
+        std::fflush(stdout);
+        DBG(0, "inet_ntop failed");
+        return 1;
+    }
+    isns_addr_family = family;
+    DBG(1, "resolve address as %s", isns_server_addr);
+    return 0;
+}
+
+enum class wake { reload, stop };
+
+// The waiting states (Registered, Unregistered, Idle) of one pass: signal
+// checks, one interval, then exactly one server check. Returns how the pass
+// ends.
+wake wait_for_event(int count, const sigset_t *open_mask)
+{
+    for (;;) {
+        switch (g_pending_event) {
+        case SIGUSR1:
+            DBG(1, "Received event SIGUSR1(%d)", SIGUSR1);
+            g_pending_event = -1;
+            g_registered = 0;
+            return wake::reload;
+        case SIGUSR2:
+            DBG(1, "Received event SIGUSR2(%d)", SIGUSR2);
+            g_pending_event = -1;
+            g_registered = 0;
+            return wake::reload;
+        case SIGTERM:
+            DBG(1, "Received event SIGTERM(%d)", SIGTERM);
+            g_pending_event = -1;
+            return wake::stop;
+        default:
+            break;
+        }
+        if (!wait_interval(open_mask) || count <= 0)
+            continue;
+
+        int r = isns_check_registration(isns_entity_name);
+        if (g_registered) {
+            if (r == 0) {
+                DBG(1, "our data on server has been delete, reinit");
+                g_registered = 0;
+                return wake::reload;
+            }
+            if (r == -1) {
+                DBG(1, "server failed");
+                g_registered = 0;
+            }
+        } else if (r != -1) {
+            DBG(1, "ret = %d, server is back, reinit", r);
+            return wake::reload;
+        }
+    }
+}
+
+}  // namespace
+
+int nesrad_main(int argc, char **argv, unsigned poll_interval)
+{
+    const char *arg = argc > 1 ? argv[1] : nullptr;
+    if (!arg || !arg[0]) {
+        std::puts("isns host address not given");
+        return 1;
+    }
+    if (std::strlen(arg) > kMaxHostArg) {
+        std::printf("isns host address length exceed max len = %u\n",
+                    static_cast<unsigned>(kMaxHostArg));
+        return 1;
+    }
+    g_poll_interval = poll_interval;
+
+    int rc = iscsi_conf_init(&g_nesrad_conf);
+    if (rc == ERR_CONF_TYPE) {
+        std::puts("not supported config type");
+        return 1;
+    }
+    if (rc != 0) {
+        std::puts("get config failed");
+        return 1;
+    }
+    dbg_get_conf_target_debug_lv(&g_nesrad_conf);  // sets the process-wide level
+    iscsi_mod_select(2);
+
+    copy_bounded(g_server_host, sizeof g_server_host, arg);
+    if (resolve_server(g_server_host) != 0)
+        return 1;
+
+    // Block our signals before the handler exists and before the pid is
+    // published: the management tool may signal as soon as it reads the pid.
+    sigset_t ours, old_mask;
+    sigemptyset(&ours);
+    sigaddset(&ours, SIGUSR1);
+    sigaddset(&ours, SIGUSR2);
+    sigaddset(&ours, SIGTERM);
+    sigprocmask(SIG_BLOCK, &ours, &old_mask);
+    sigset_t open_mask = old_mask;
+    sigdelset(&open_mask, SIGUSR1);
+    sigdelset(&open_mask, SIGUSR2);
+    sigdelset(&open_mask, SIGTERM);
+
+    struct sigaction sa{};
+    sa.sa_handler = on_signal;
+    sigemptyset(&sa.sa_mask);
+    sa.sa_flags = 0;
+    sigaction(SIGUSR1, &sa, nullptr);
+    sigaction(SIGUSR2, &sa, nullptr);
+    sigaction(SIGTERM, &sa, nullptr);
+
+    write_pid(1);
+
+    for (;;) {
+        int count = init_iqn_list();
+        if (count < 0) {
+            // The pid stays stored, as of a daemon that died.
+            _iqn_clear();
+            return -1;
+        }
+        if (count > 0 && target_register_iSNS_all() == 0)
+            g_registered = 1;
+
+        wake how = wait_for_event(count, &open_mask);
+
+        target_deregister_entity_identifier();
+        _iqn_clear();
+        if (how == wake::stop) {
+            write_pid(0);
+            return 0;
+        }
+    }
 }

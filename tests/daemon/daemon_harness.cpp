@@ -1,0 +1,193 @@
+// The appliance in a test root, and the daemon as a real process.
+#include "tests/daemon/daemon_harness.h"
+
+#include <dirent.h>
+#include <fcntl.h>
+#include <signal.h>
+#include <sys/prctl.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <cstdio>
+#include <cstdlib>
+#include <fstream>
+#include <sstream>
+
+#include <gtest/gtest.h>
+
+#include "platform/platform_util.h"
+#include "tests/support/xmldbd_fixture.h"
+
+#ifndef NESRAD_BIN
+#define NESRAD_BIN "nesrad"
+#endif
+#ifndef NESRAD_TEST_BIN
+#define NESRAD_TEST_BIN "nesrad_short"
+#endif
+
+namespace korv_test {
+
+namespace {
+
+constexpr const char *kConfigfsIscsi = "/sys/kernel/config/target/iscsi";
+
+std::string read_file(const std::string &path)
+{
+    std::ifstream in(path);
+    std::stringstream ss;
+    ss << in.rdbuf();
+    return ss.str();
+}
+
+}  // namespace
+
+void set_host_name(const std::string &name)
+{
+    SysRoot::write("/proc/sys/kernel/hostname", name + "\n");
+}
+
+std::string target_iqn(const std::string &entity_id, const std::string &target)
+{
+    return std::string(kPrefix) + entity_id + ":" + target;
+}
+
+void store_targets(const std::string &entity_id, const std::vector<target_spec> &targets,
+                   int debug_level)
+{
+    ASSERT_EQ(0, dbSetStr(kPrefix, "/iscsi/target/iqn_prefix"));
+    ASSERT_EQ(0, dbSetLL(debug_level, "/iscsi/target/dbg"));
+    ASSERT_EQ(0, dbDelete("/iscsi/target/id"));
+    for (size_t i = 0; i < targets.size(); ++i) {
+        std::string base = "/iscsi/target/id:" + std::to_string(i + 1) + "/";
+        ASSERT_EQ(0, dbSetStr(targets[i].name.c_str(), (base + "name").c_str()));
+        if (targets[i].tpgt >= 0) {
+            ASSERT_EQ(0, dbSetLL(targets[i].tpgt, (base + "tpgt").c_str()));
+        }
+    }
+    // Entries beyond the list end the reader's walk only when their name is
+    // empty: clear what an earlier call may have stored.
+    for (size_t i = targets.size() + 1; i <= 64; ++i)
+        dbDelete(("/iscsi/target/id:" + std::to_string(i)).c_str());
+    ASSERT_EQ(0, dbSetLL(static_cast<long long>(targets.size()), "/iscsi/target/count"));
+
+    SysRoot::remove(kConfigfsIscsi);
+    for (const target_spec &t : targets) {
+        if (!t.in_kernel)
+            continue;
+        std::string tpg = std::string(kConfigfsIscsi) + "/" + target_iqn(entity_id, t.name) +
+                          "/tpgt_" + std::to_string(t.tpgt);
+        SysRoot::mkdirs(tpg + "/np");
+        for (const std::string &np : t.portals)
+            SysRoot::mkdirs(tpg + "/np/" + np);
+    }
+}
+
+long long stored_pid()
+{
+    char buf[32] = {};
+    if (dbGetStr(buf, sizeof buf, "/system_mgr/iscsi/iSNS/pid") != 0)
+        return -1;
+    return std::atoll(buf);
+}
+
+std::string nesrad_binary() { return NESRAD_BIN; }
+std::string nesrad_test_binary() { return NESRAD_TEST_BIN; }
+
+daemon_process::daemon_process(const std::string &binary, const std::string &server,
+                               std::vector<std::string> wrapper)
+{
+    char tmpl[] = "/tmp/nesrad-log-XXXXXX";
+    int fd = mkstemp(tmpl);
+    if (fd < 0) {
+        ADD_FAILURE() << "mkstemp failed";
+        return;
+    }
+    log_ = tmpl;
+    std::vector<std::string> words = std::move(wrapper);
+    words.push_back(binary);
+    words.push_back(server);
+    std::fflush(nullptr);
+    pid_ = fork();
+    if (pid_ == 0) {
+        prctl(PR_SET_PDEATHSIG, SIGKILL);
+        dup2(fd, STDOUT_FILENO);
+        dup2(fd, STDERR_FILENO);
+        // The daemon must start with our signals in their default state.
+        sigset_t none;
+        sigemptyset(&none);
+        sigprocmask(SIG_SETMASK, &none, nullptr);
+        for (int i = 3; i < 1024; ++i)
+            close(i);
+        std::vector<char *> argv;
+        for (std::string &w : words)
+            argv.push_back(w.data());
+        argv.push_back(nullptr);
+        execv(argv[0], argv.data());
+        _exit(127);
+    }
+    close(fd);
+}
+
+daemon_process::~daemon_process()
+{
+    if (pid_ > 0) {
+        kill(pid_, SIGKILL);
+        waitpid(pid_, nullptr, 0);
+    }
+    if (!log_.empty())
+        unlink(log_.c_str());
+}
+
+void daemon_process::signal(int sig) const
+{
+    if (pid_ > 0)
+        kill(pid_, sig);
+}
+
+int daemon_process::wait_exit(std::chrono::milliseconds limit)
+{
+    if (pid_ <= 0)
+        return -1;
+    int status = 0;
+    bool done = eventually([&] { return waitpid(pid_, &status, WNOHANG) == pid_; }, limit);
+    if (!done)
+        return -1;
+    pid_ = -1;
+    return WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
+}
+
+std::string daemon_process::output() const
+{
+    return read_file(log_);
+}
+
+int daemon_process::count(const std::string &text) const
+{
+    std::string out = output();
+    int n = 0;
+    for (size_t at = out.find(text); at != std::string::npos; at = out.find(text, at + text.size()))
+        ++n;
+    return n;
+}
+
+bool daemon_process::wait_for(const std::string &text, std::chrono::milliseconds limit, int n) const
+{
+    return eventually([&] { return count(text) >= n; }, limit);
+}
+
+int daemon_process::open_fds(int below) const
+{
+    if (pid_ <= 0)
+        return -1;
+    DIR *dir = opendir(("/proc/" + std::to_string(pid_) + "/fd").c_str());
+    if (!dir)
+        return -1;
+    int n = 0;
+    while (dirent *e = readdir(dir))
+        if (e->d_name[0] != '.' && std::atoi(e->d_name) < below)
+            ++n;
+    closedir(dir);
+    return n;
+}
+
+}  // namespace korv_test

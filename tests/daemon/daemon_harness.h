@@ -1,0 +1,95 @@
+// What the daemon's tests stand on: an appliance in the test's system root
+// (host name, stored targets and IQN prefix, the kernel's portal directories)
+// and the daemon run as a real process with its output in a file.
+#pragma once
+
+#include <sys/types.h>
+
+#include <chrono>
+#include <string>
+#include <vector>
+
+namespace korv_test {
+
+// The IQN prefix the tests store; neutral domain.
+inline constexpr const char *kPrefix = "iqn.2026-01.org.example:";
+
+// Portal directory names as the kernel shows them under np/.
+inline constexpr const char *kPortalV4 = "192.0.2.10:3260";
+inline constexpr const char *kPortalV6 = "[2001:db8::10]:3260";
+
+struct target_spec {
+    std::string name;
+    int tpgt = 1;
+    std::vector<std::string> portals{kPortalV4, kPortalV6};  // np/ entries
+    bool in_kernel = true;  // false: no configfs directory at all
+};
+
+// Writes "<root>/proc/sys/kernel/hostname".
+void set_host_name(const std::string &name);
+
+// Stores the IQN prefix, the debug level and the targets (entries 1..n,
+// anything stored beyond them removed) in the running configuration
+// service, and creates each target's portal directories for the IQN the
+// daemon will build for host `entity_id`. Previous portal directories go.
+void store_targets(const std::string &entity_id, const std::vector<target_spec> &targets,
+                   int debug_level = 1);
+
+// prefix + entity_id + ":" + target.
+std::string target_iqn(const std::string &entity_id, const std::string &target);
+
+// The stored daemon pid ("/system_mgr/iscsi/iSNS/pid"); -1 when unreadable.
+long long stored_pid();
+
+// The installed daemon and the test-only one (same loop, short interval).
+std::string nesrad_binary();
+std::string nesrad_test_binary();
+// Interval of the test-only daemon, seconds.
+inline constexpr int kTestInterval = 2;
+
+class daemon_process {
+public:
+    // Runs `binary server` (extra words before the argument, e.g. valgrind,
+    // go in `wrapper`) with stdout and stderr in a file; env as ours.
+    daemon_process(const std::string &binary, const std::string &server,
+                   std::vector<std::string> wrapper = {});
+    ~daemon_process();  // SIGKILLs a daemon still running
+    daemon_process(const daemon_process &) = delete;
+    daemon_process &operator=(const daemon_process &) = delete;
+
+    pid_t pid() const { return pid_; }
+    void signal(int sig) const;
+    // Exit status (or 128+signal) when the process ends within the time; -1
+    // when it is still running then.
+    int wait_exit(std::chrono::milliseconds limit);
+    // Everything the daemon printed so far.
+    std::string output() const;
+    // Occurrences of `text` in the output.
+    int count(const std::string &text) const;
+    // Waits until the output holds `text` at least n times.
+    bool wait_for(const std::string &text, std::chrono::milliseconds limit, int n = 1) const;
+    // Open descriptors of the running process; -1 when unreadable. With
+    // below set, only descriptors below it count (valgrind's own sit high).
+    int open_fds(int below = 1 << 30) const;
+
+private:
+    pid_t pid_ = -1;
+    std::string log_;
+};
+
+// Polls pred every 50 ms until it holds or the time is over.
+template <class Pred>
+bool eventually(Pred pred, std::chrono::milliseconds limit)
+{
+    auto end = std::chrono::steady_clock::now() + limit;
+    for (;;) {
+        if (pred())
+            return true;
+        if (std::chrono::steady_clock::now() >= end)
+            return false;
+        struct timespec ts{0, 50 * 1000 * 1000};
+        nanosleep(&ts, nullptr);
+    }
+}
+
+}  // namespace korv_test
