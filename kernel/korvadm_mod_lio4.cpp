@@ -12,6 +12,7 @@
 #include <memory>
 #include <string>
 #include <string_view>
+#include <utility>
 #include <vector>
 
 #include "common/korvadm_err.h"
@@ -765,7 +766,41 @@ int _lio3_set_target_chap_all_acl(const iscsi_target_t *target)
 
 /* ========================================================= teardown steps */
 
-// Removes every sub-directory of dir recursively, ignoring single failures.
+// Removes a configfs group the way the kernel allows: attribute files cannot
+// be unlinked ("rm -rf" stops at them), so links are unlinked, child groups
+// removed depth first, attributes left to go with their group. Default groups
+// refuse rmdir and vanish with their parent, so only the top result counts.
+int remove_configfs_group(const std::string &path, int depth = 0)
+{
+    if (depth > 16)
+        return ERR_CONFIGFS;
+    if (dir_ptr d{opendir(path.c_str())}) {
+        std::vector<std::pair<std::string, bool>> entries;  // name, is a directory
+        while (struct dirent *e = readdir(d.get())) {
+            std::string_view name(e->d_name);
+            if (name == "." || name == "..")
+                continue;
+            struct stat st;
+            std::string full = path + "/" + e->d_name;
+            if (lstat(full.c_str(), &st) != 0)
+                continue;
+            if (S_ISLNK(st.st_mode))
+                entries.emplace_back(full, false);
+            else if (S_ISDIR(st.st_mode))
+                entries.emplace_back(full, true);
+        }
+        d.reset();
+        for (const auto &[full, is_dir] : entries) {
+            if (is_dir)
+                remove_configfs_group(full, depth + 1);
+            else
+                remove_file(full.c_str());
+        }
+    }
+    return remove_dir(path.c_str()) == 0 ? KORV_OK : ERR_CONFIGFS;
+}
+
+// Removes every sub-directory of dir, ignoring single failures.
 int remove_all_subdirs(const std::string &dir)
 {
     std::vector<std::string> names;
@@ -774,7 +809,8 @@ int remove_all_subdirs(const std::string &dir)
         return ERR_PARAM;
     }
     for (const std::string &name : names)
-        configfs_rmdir_recursive((dir + "/" + name).c_str());
+        if (remove_configfs_group(dir + "/" + name) != 0)
+            DBG(2, "remove %s/%s failed", dir.c_str(), name.c_str());
     return KORV_OK;
 }
 
@@ -856,9 +892,10 @@ int lio3_add_target(iscsi_target_t *target)
     }
     if (_set_target_default_attributes(target) != 0)
         DBG(0, "set default attributes failed");
-    // The kernel may hold no default_policy node; the write is best effort.
+    // Best effort: the kernel holds a default_policy node only when one was made.
     std::string dataout = tpg + "/acls/default_policy/attrib/dataout_timeout";
-    configfs_write_attr_int(dataout.c_str(), target->dataout_timeout, 0);
+    if (configfs_path_exist(dataout.c_str()) == 0)
+        configfs_write_attr_int(dataout.c_str(), target->dataout_timeout, 0);
     return KORV_OK;
 }
 

@@ -597,6 +597,28 @@ TEST_F(Lio4Test, DataOutTimeoutGoesToEveryAcl)
     EXPECT_EQ(lio3_set_target_attr_dataout_timeout(-1, t), ERR_PARAM);
 }
 
+TEST_F(Lio4Test, GroupRemovalUnlinksLinksWithoutFollowingThem)
+{
+    iscsi_target_t *t = target();
+    std::string backstore = at("/sys/kernel/config/target/core/fileio_0/disk1");
+    write_file(backstore + "/data", "keep");
+    mkdirs(tpg() + "/lun/lun_0");
+    mkdirs(tpg() + "/acls/iqn.i1/lun_0");
+    mkdirs(tpg() + "/acls/iqn.i1/attrib");
+    ASSERT_EQ(symlink(backstore.c_str(), (tpg() + "/lun/lun_0/disk1").c_str()), 0);
+    ASSERT_EQ(symlink((tpg() + "/lun/lun_0").c_str(), (tpg() + "/acls/iqn.i1/lun_0/lun_0").c_str()), 0);
+
+    ASSERT_EQ(_lio3_remove_all_acl(t), 0);
+    EXPECT_FALSE(exists(tpg() + "/acls/iqn.i1"));
+    EXPECT_TRUE(exists(tpg() + "/lun/lun_0/disk1"));
+    ASSERT_EQ(_lio3_remove_all_lun(t), 0);
+    EXPECT_FALSE(exists(tpg() + "/lun/lun_0"));
+    EXPECT_EQ(read_file(backstore + "/data"), "keep");
+
+    t->tpgt = 2;  // no such portal group
+    EXPECT_EQ(_lio3_remove_all_acl(t), ERR_PARAM);
+}
+
 TEST_F(Lio4Test, ShutdownBackstoreChecksTheLun)
 {
     iscsi_lun_t *lun = iscsi_lun_new();
