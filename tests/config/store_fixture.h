@@ -8,9 +8,22 @@
 #include <gtest/gtest.h>
 
 #include "platform/xmldbc.h"
+#include "tests/support/capture.h"
 #include "tests/support/xmldbd_fixture.h"
 
 namespace korv_test {
+
+// fn()'s result, with the log lines it prints kept out of the test's output
+// (and handed back in *out when asked for).
+template <class Fn>
+auto quiet(Fn fn, std::string *out = nullptr)
+{
+    decltype(fn()) result{};
+    std::string text = capture_stdout([&] { result = fn(); });
+    if (out)
+        *out = std::move(text);
+    return result;
+}
 
 class StoreTest : public ::testing::Test {
 protected:

@@ -13,7 +13,7 @@
 #include "tests/config/store_fixture.h"
 #include "tests/support/capture.h"
 
-using korv_test::capture_stdout;
+using korv_test::quiet;
 using korv_test::StoreTest;
 using korv_test::SysRoot;
 
@@ -117,7 +117,7 @@ TEST_F(GeneratedIqn, PrefixThenFirstColonSecond)
     put("/iscsi/target/iqn_prefix", "iqn.2000-01.com.example:");
     EXPECT_EQ(iscsi_conf_generate_iqn(out, "nas", "t1"), 30);
     EXPECT_STREQ(out, "iqn.2000-01.com.example:nas:t1");
-    capture_stdout([&] { EXPECT_EQ(iscsi_conf_generate_iqn(out, nullptr, "t1"), ERR_PARAM); });
+    EXPECT_EQ(quiet([&] { return iscsi_conf_generate_iqn(out, nullptr, "t1"); }), ERR_PARAM);
 }
 
 TEST_F(GeneratedIqn, LongPartsAreCutToTheBuffer)
@@ -147,7 +147,8 @@ TEST_F(ConfContext, InitFailsWithoutAHostName)
 {
     SysRoot::remove("/proc/sys/kernel/hostname");
     iscsi_conf_ctx_t ctx;
-    std::string out = capture_stdout([&] { EXPECT_EQ(iscsi_conf_init(&ctx), ERR_DB_WRITE); });
+    std::string out;
+    EXPECT_EQ(quiet([&] { return iscsi_conf_init(&ctx); }, &out), ERR_DB_WRITE);
     EXPECT_EQ(out, "get host name failed\n");
 }
 
@@ -159,7 +160,8 @@ TEST_F(DebugLevel, StoredLevelBecomesTheProcessLevel)
     ctx.ops = &iscsi_conf_ops;
     g_korv_debug_level = 0;
     put("/iscsi/target/dbg", "2");
-    std::string out = capture_stdout([&] { EXPECT_EQ(dbg_get_conf_target_debug_lv(&ctx), 2); });
+    std::string out;
+    EXPECT_EQ(quiet([&] { return dbg_get_conf_target_debug_lv(&ctx); }, &out), 2);
     EXPECT_EQ(g_korv_debug_level, 2);
     EXPECT_NE(out.find("(korvadm_debug:dbg_get_conf_target_debug_lv:"), std::string::npos) << out;
     EXPECT_NE(out.find("get debug level = 2\n"), std::string::npos) << out;
@@ -171,7 +173,8 @@ TEST_F(DebugLevel, UnsetOrUnreachableLeavesTheLevelAlone)
     iscsi_conf_ctx_t ctx = {};
     ctx.ops = &iscsi_conf_ops;
     g_korv_debug_level = 1;
-    std::string out = capture_stdout([&] { EXPECT_EQ(dbg_get_conf_target_debug_lv(&ctx), 0); });
+    std::string out;
+    EXPECT_EQ(quiet([&] { return dbg_get_conf_target_debug_lv(&ctx); }, &out), 0);
     EXPECT_EQ(g_korv_debug_level, 1);
     EXPECT_EQ(out.find("get debug level"), std::string::npos);
 

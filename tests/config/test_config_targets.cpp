@@ -11,7 +11,7 @@
 #include "tests/config/store_fixture.h"
 #include "tests/support/capture.h"
 
-using korv_test::capture_stdout;
+using korv_test::quiet;
 using korv_test::StoreTest;
 
 namespace {
@@ -68,11 +68,9 @@ TEST_F(IdEntryScan, MatchesWholeValuesWithinTheLimit)
     EXPECT_EQ(_search_xmldb_id_entry(&id, "/l", 0, "name", "ab"), ID_ENTRY_NOT_FOUND);
     EXPECT_EQ(_get_free_xmldb_id_entry(&id, "/l", -1, "name"), ID_ENTRY_NOT_FOUND);
     EXPECT_EQ(_cal_xmldb_id_entry_count("/l", 0, "name"), 0);
-    capture_stdout([&] {
-        EXPECT_EQ(_search_xmldb_id_entry(&id, nullptr, 10, "name", "a"), ERR_PARAM);
-        EXPECT_EQ(_get_free_xmldb_id_entry(nullptr, "/l", 10, "name"), ERR_PARAM);
-        EXPECT_EQ(_cal_xmldb_id_entry_count("/l", 10, nullptr), -1);
-    });
+    EXPECT_EQ(quiet([&] { return _search_xmldb_id_entry(&id, nullptr, 10, "name", "a"); }), ERR_PARAM);
+    EXPECT_EQ(quiet([&] { return _get_free_xmldb_id_entry(nullptr, "/l", 10, "name"); }), ERR_PARAM);
+    EXPECT_EQ(quiet([&] { return _cal_xmldb_id_entry_count("/l", 10, nullptr); }), -1);
 }
 
 using Counters = StoreTest;
@@ -165,13 +163,14 @@ TEST_F(TargetAdd, RefusesInvalidRecordsBeforeAnyWrite)
     for (const auto &c : cases) {
         target_conf_t *t = filled_target("bad");
         c.spoil(t);
-        std::string out = capture_stdout([&] { EXPECT_EQ(xmldb_add_new_target(t), ERR_PARAM) << c.message; });
+        std::string out;
+        EXPECT_EQ(quiet([&] { return xmldb_add_new_target(t); }, &out), ERR_PARAM) << c.message;
         EXPECT_NE(out.find(c.message), std::string::npos) << out;
         target_conf_free(t);
     }
     EXPECT_EQ(raw("/iscsi/target/id:1/name"), "");
     EXPECT_EQ(raw("/iscsi/target/count"), "");
-    capture_stdout([] { EXPECT_EQ(xmldb_add_new_target(nullptr), ERR_PARAM); });
+    EXPECT_EQ(quiet([&] { return xmldb_add_new_target(nullptr); }), ERR_PARAM);
 }
 
 TEST_F(TargetAdd, SixtyFifthTargetIsRefusedAndWritesNothing)
@@ -185,7 +184,8 @@ TEST_F(TargetAdd, SixtyFifthTargetIsRefusedAndWritesNothing)
     EXPECT_EQ(xmldb_check_add_target("t64"), 1);
 
     target_conf_t *t = filled_target("t65");
-    std::string out = capture_stdout([&] { EXPECT_EQ(xmldb_add_new_target(t), ERR_NO_ROOM); });
+    std::string out;
+    EXPECT_EQ(quiet([&] { return xmldb_add_new_target(t); }, &out), ERR_NO_ROOM);
     EXPECT_NE(out.find("the maximum number of targets has reached"), std::string::npos);
     EXPECT_EQ(raw("/iscsi/target/id:65/name"), "");
     EXPECT_EQ(raw("/iscsi/target/count"), "");
@@ -220,16 +220,14 @@ TEST_F(TargetFields, ReadAndWriteByName)
     EXPECT_EQ(xmldb_get_target_iqn(buf, sizeof buf, "alpha"), KORV_OK);
     EXPECT_STREQ(buf, "iqn.2000-01.com.example:new");
 
-    capture_stdout([&] {
-        EXPECT_EQ(xmldb_get_target_tpgt(&v, "gamma"), ERR_NOT_FOUND);
-        EXPECT_EQ(xmldb_set_target_state(1, "gamma"), ERR_NOT_FOUND);
-        EXPECT_EQ(xmldb_get_target_iqn(buf, sizeof buf, "gamma"), ERR_PARAM);
-        EXPECT_EQ(xmldb_get_target_iqn(buf, 100, "alpha"), ERR_PARAM);
-        EXPECT_EQ(xmldb_get_target_status(buf, 10, "alpha"), ERR_PARAM);
-        EXPECT_EQ(xmldb_get_target_tpgt(nullptr, "alpha"), ERR_PARAM);
-    });
+    EXPECT_EQ(quiet([&] { return xmldb_get_target_tpgt(&v, "gamma"); }), ERR_NOT_FOUND);
+    EXPECT_EQ(quiet([&] { return xmldb_set_target_state(1, "gamma"); }), ERR_NOT_FOUND);
+    EXPECT_EQ(quiet([&] { return xmldb_get_target_iqn(buf, sizeof buf, "gamma"); }), ERR_PARAM);
+    EXPECT_EQ(quiet([&] { return xmldb_get_target_iqn(buf, 100, "alpha"); }), ERR_PARAM);
+    EXPECT_EQ(quiet([&] { return xmldb_get_target_status(buf, 10, "alpha"); }), ERR_PARAM);
+    EXPECT_EQ(quiet([&] { return xmldb_get_target_tpgt(nullptr, "alpha"); }), ERR_PARAM);
     put(tpath(2, "tpgt"), "");
-    capture_stdout([&] { EXPECT_EQ(xmldb_get_target_tpgt(&v, "beta"), ERR_INT_VALUE); });
+    EXPECT_EQ(quiet([&] { return xmldb_get_target_tpgt(&v, "beta"); }), ERR_INT_VALUE);
 }
 
 TEST_F(TargetFields, ChapSwitchWritesOrClearsCredentials)
@@ -242,10 +240,8 @@ TEST_F(TargetFields, ChapSwitchWritesOrClearsCredentials)
     EXPECT_EQ(raw(tpath(1, "chap_enable")), "0");
     EXPECT_EQ(raw(tpath(1, "chap_name")), "");
     EXPECT_EQ(raw(tpath(1, "chap_pwd")), "");
-    capture_stdout([] {
-        EXPECT_EQ(xmldb_set_target_chap(2, "u", "p", "alpha"), ERR_PARAM);
-        EXPECT_EQ(xmldb_set_target_chap(1, "u", "p", "nobody"), ERR_NOT_FOUND);
-    });
+    EXPECT_EQ(quiet([&] { return xmldb_set_target_chap(2, "u", "p", "alpha"); }), ERR_PARAM);
+    EXPECT_EQ(quiet([&] { return xmldb_set_target_chap(1, "u", "p", "nobody"); }), ERR_NOT_FOUND);
     EXPECT_EQ(raw(tpath(1, "chap_enable")), "0");
 }
 
@@ -273,15 +269,15 @@ TEST_F(TargetDelete, LeavesAGapThatHidesLaterTargets)
     put_target(2, "b");
     put_target(3, "c");
     put("/iscsi/target/count", "3");
-    capture_stdout([] { EXPECT_EQ(xmldb_del_target_by_name("b"), KORV_OK); });
+    EXPECT_EQ(quiet([&] { return xmldb_del_target_by_name("b"); }), KORV_OK);
     EXPECT_EQ(raw(tpath(2, "iqn")), "");
     EXPECT_EQ(raw("/iscsi/target/count"), "2");
     EXPECT_EQ(raw(tpath(3, "name")), "c");
     EXPECT_EQ(xmldb_check_target_exist("c"), 0);
     int v = 0;
-    capture_stdout([&] { EXPECT_EQ(xmldb_get_target_tpgt(&v, "c"), ERR_NOT_FOUND); });
+    EXPECT_EQ(quiet([&] { return xmldb_get_target_tpgt(&v, "c"); }), ERR_NOT_FOUND);
     EXPECT_EQ(xmldb_check_target_exist("a"), 1);
-    capture_stdout([] { EXPECT_EQ(xmldb_del_target_by_name("b"), ERR_NOT_FOUND); });
+    EXPECT_EQ(quiet([&] { return xmldb_del_target_by_name("b"); }), ERR_NOT_FOUND);
 }
 
 TEST_F(TargetDelete, ConnectionRecordsFollowTheirTarget)
@@ -309,7 +305,7 @@ TEST_F(TargetRecount, CountsTargetsAndRunningOnesAcrossGaps)
     put(tpath(4, "status"), "No Existence");
     put_target(5, "e");  // no status: not running
     put("/iscsi/target/count", "17");
-    capture_stdout([] { EXPECT_EQ(xmldb_update_current_targetcnt(), KORV_OK); });
+    EXPECT_EQ(quiet([&] { return xmldb_update_current_targetcnt(); }), KORV_OK);
     EXPECT_EQ(raw("/iscsi/target/count"), "4");
     EXPECT_EQ(raw("/iscsi/target/running_count"), "1");
     EXPECT_EQ(raw(tpath(5, "name")), "e");
@@ -323,7 +319,7 @@ TEST_F(TargetRecount, RemovesAGhostRightAfterTheLastTargetOnly)
     put(tpath(5, "status"), "Ready");  // further on: left alone
     std::string out;
     g_korv_debug_level = 1;
-    out = capture_stdout([] { EXPECT_EQ(xmldb_update_current_targetcnt(), KORV_OK); });
+    EXPECT_EQ(quiet([&] { return xmldb_update_current_targetcnt(); }, &out), KORV_OK);
     g_korv_debug_level = 0;
     EXPECT_NE(out.find("discover and remove ghost entry at PATH: /iscsi/target/id:3"), std::string::npos) << out;
     EXPECT_EQ(raw(tpath(3, "status")), "");
@@ -363,7 +359,8 @@ TEST_F(TargetRead, LiteFailsAsAWholeOnAnUnreadableTag)
     put(tpath(2, "tpgt"), "");
     list_t list;
     list_init(&list);
-    std::string out = capture_stdout([&] { EXPECT_NE(xmldb_get_all_target_conf_lite(&list), KORV_OK); });
+    std::string out;
+    EXPECT_NE(quiet([&] { return xmldb_get_all_target_conf_lite(&list); }, &out), KORV_OK);
     EXPECT_NE(out.find("get tpgt error"), std::string::npos) << out;
     EXPECT_TRUE(list_is_empty(&list));
 
@@ -379,7 +376,7 @@ TEST_F(TargetRead, LiteFailsWhenTheDatabaseIsUnreachable)
     db().kill();
     list_t list;
     list_init(&list);
-    capture_stdout([&] { EXPECT_EQ(xmldb_get_all_target_conf_lite(&list), ERR_DB_CLIENT); });
+    EXPECT_EQ(quiet([&] { return xmldb_get_all_target_conf_lite(&list); }), ERR_DB_CLIENT);
     EXPECT_TRUE(list_is_empty(&list));
 }
 
@@ -413,7 +410,7 @@ TEST_F(TargetRead, FullReadFillsEveryFieldAndChapOnlyWhenOn)
     EXPECT_EQ(xmldb_get_target_conf_by_name(one, "b"), KORV_OK);
     EXPECT_EQ(one->dbidx, 2);
     EXPECT_STREQ(one->status, "Ready");
-    capture_stdout([&] { EXPECT_EQ(xmldb_get_target_conf_by_name(one, "zz"), ERR_NOT_FOUND); });
+    EXPECT_EQ(quiet([&] { return xmldb_get_target_conf_by_name(one, "zz"); }), ERR_NOT_FOUND);
     target_conf_free(one);
 }
 

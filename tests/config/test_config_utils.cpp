@@ -137,8 +137,8 @@ TEST_F(TypedAccess, ADeadServiceIsAClientFailure)
     EXPECT_EQ(xmldb_get_int32_t(&v, "/t/i"), ERR_DB_CLIENT);
     EXPECT_EQ(v, 0);
     char buf[8];
-    std::string out = korv_test::capture_stdout(
-        [&] { EXPECT_EQ(xmldb_get_cstring(buf, sizeof buf, "/t/i"), ERR_DB_CLIENT); });
+    std::string out;
+    EXPECT_EQ(korv_test::quiet([&] { return xmldb_get_cstring(buf, sizeof buf, "/t/i"); }, &out), ERR_DB_CLIENT);
     EXPECT_NE(out.find("xmldbc_get path = /t/i failed"), std::string::npos) << out;
     EXPECT_EQ(xmldb_set_int32_t(1, "/t/i"), ERR_DB_CLIENT);
     EXPECT_EQ(xmldb_set_cstring("x", "/t/i"), ERR_DB_CLIENT);
@@ -222,13 +222,12 @@ TEST(Converters, RefuseNullArguments)
     char *end = nullptr;
     long l = 0;
     uint64_t u = 0;
-    std::string out = korv_test::capture_stdout([&] {
-        EXPECT_EQ(convert_dec_str_to_l(nullptr, &end, &l), ERR_PARAM);
-        EXPECT_EQ(convert_hex_str_to_l("1", &end, nullptr), ERR_PARAM);
-        EXPECT_EQ(convert_dec_str_to_uint64_t(nullptr, &end, &u), ERR_PARAM);
-        EXPECT_EQ(convert_str_to_uint64_t(nullptr, &u), ERR_PARAM);
-    });
+    std::string out;
+    EXPECT_EQ(korv_test::quiet([&] { return convert_dec_str_to_l(nullptr, &end, &l); }, &out), ERR_PARAM);
     EXPECT_NE(out.find("ERR_PARAM_ERROR"), std::string::npos);
+    EXPECT_EQ(korv_test::quiet([&] { return convert_hex_str_to_l("1", &end, nullptr); }), ERR_PARAM);
+    EXPECT_EQ(korv_test::quiet([&] { return convert_dec_str_to_uint64_t(nullptr, &end, &u); }), ERR_PARAM);
+    EXPECT_EQ(korv_test::quiet([&] { return convert_str_to_uint64_t(nullptr, &u); }), ERR_PARAM);
     // A caller that does not want the end pointer may pass none.
     EXPECT_EQ(convert_dec_str_to_l("12", nullptr, &l), 0);
     EXPECT_EQ(l, 12);

@@ -11,7 +11,7 @@
 #include "tests/config/store_fixture.h"
 #include "tests/support/capture.h"
 
-using korv_test::capture_stdout;
+using korv_test::quiet;
 using korv_test::StoreTest;
 using korv_test::SysRoot;
 
@@ -36,7 +36,7 @@ TEST(AddressEntries, SearchCompareAndFree)
     EXPECT_EQ(iscsi_ip_search_list_by_IPv6(&list, "2001:db8::2"), b);
     // b has no IPv4: "" must not find it.
     EXPECT_EQ(iscsi_ip_search_list_by_IPv4(&list, ""), nullptr);
-    capture_stdout([&] { EXPECT_EQ(iscsi_ip_search_list_by_IPv6(&list, nullptr), nullptr); });
+    EXPECT_EQ(quiet([&] { return iscsi_ip_search_list_by_IPv6(&list, nullptr); }), nullptr);
 
     EXPECT_EQ(iscsi_ip_cmp_ip(a, a), 1);  // same IPv4, same IPv6
     EXPECT_EQ(iscsi_ip_cmp_ip(a, b), 1);  // both differ
@@ -44,7 +44,7 @@ TEST(AddressEntries, SearchCompareAndFree)
     std::strcpy(c->ipv4, "192.0.2.1");
     std::strcpy(c->ipv6, "2001:db8::9");
     EXPECT_EQ(iscsi_ip_cmp_ip(a, c), 2);
-    capture_stdout([&] { EXPECT_EQ(iscsi_ip_cmp_ip(a, nullptr), -1); });
+    EXPECT_EQ(quiet([&] { return iscsi_ip_cmp_ip(a, nullptr); }), -1);
     iscsi_ip_free(c);
 
     iscsi_ip_free(a);
@@ -100,7 +100,7 @@ protected:
     {
         list_t list;
         list_init(&list);
-        capture_stdout([&] { EXPECT_EQ(sys_net_get_ip_list(&list), expect_rc); });
+        EXPECT_EQ(quiet([&] { return sys_net_get_ip_list(&list); }), expect_rc);
         std::vector<Entry> out;
         for (iscsi_ip_t *ip : korv::list_records<iscsi_ip_t>(&list))
             out.push_back({ip->dev_name, ip->ipv4, ip->ipv6});
@@ -183,11 +183,11 @@ TEST_F(NetList, AppendsWithoutClearingAndRefusesNull)
     list_init(&list);
     iscsi_ip_t *mine = iscsi_ip_new();
     list_append(&mine->node, &list);
-    capture_stdout([&] { EXPECT_EQ(sys_net_get_ip_list(&list), KORV_OK); });
+    EXPECT_EQ(quiet([&] { return sys_net_get_ip_list(&list); }), KORV_OK);
     EXPECT_EQ(list.count, 2);
     EXPECT_EQ(list.head, &mine->node);
     iscsi_ip_free_list(&list);
-    capture_stdout([] { EXPECT_EQ(sys_net_get_ip_list(nullptr), ERR_PARAM); });
+    EXPECT_EQ(quiet([&] { return sys_net_get_ip_list(nullptr); }), ERR_PARAM);
 }
 
 TEST_F(NetList, OverlongStoredAddressesAreCut)
@@ -236,5 +236,5 @@ TEST(MacAddress, Lan1InLowerCaseColonForm)
     ASSERT_EQ(sys_net_get_lan1_mac_str(mac), KORV_OK);
     EXPECT_STREQ(mac, "00:1a:2b:3c:4d:5e");
     SysRoot::write("/sys/class/net/egiga0/address", "garbage\n");
-    capture_stdout([&] { EXPECT_EQ(sys_net_get_lan1_mac_str(mac), ERR_DB_WRITE); });
+    EXPECT_EQ(quiet([&] { return sys_net_get_lan1_mac_str(mac); }), ERR_DB_WRITE);
 }
