@@ -58,7 +58,9 @@ clock_type::time_point current_deadline()
                          : clock_type::now() + std::chrono::milliseconds(ISNS_RECV_DEADLINE_MS);
 }
 
-/* Reads until len bytes, 1 s of silence, end of stream or the deadline. */
+/* Reads until len bytes, 1 s of silence, end of stream or the deadline.
+ * Reads first and waits only when nothing is there: the payload usually
+ * arrives with its header. */
 int read_bounded(int fd, unsigned char *dest, int len, clock_type::time_point deadline)
 {
     int got = 0;
@@ -67,18 +69,17 @@ int read_bounded(int fd, unsigned char *dest, int len, clock_type::time_point de
                               deadline - clock_type::now()).count();
         if (left <= 0)
             break;
+        const ssize_t n = recv(fd, dest + got, static_cast<size_t>(len - got), MSG_DONTWAIT);
+        if (n > 0) {
+            got += static_cast<int>(n);
+            continue;
+        }
+        if (n == 0 || (errno != EAGAIN && errno != EWOULDBLOCK && errno != EINTR))
+            break;
         pollfd pfd{fd, POLLIN, 0};
         const int pr = poll(&pfd, 1, static_cast<int>(left < ISNS_SILENCE_MS ? left : ISNS_SILENCE_MS));
-        if (pr < 0 && errno == EINTR)
-            continue;
-        if (pr <= 0)
+        if (pr == 0 || (pr < 0 && errno != EINTR))
             break;
-        const ssize_t n = recv(fd, dest + got, static_cast<size_t>(len - got), 0);
-        if (n < 0 && errno == EINTR)
-            continue;
-        if (n <= 0)
-            break;
-        got += static_cast<int>(n);
     }
     return got;
 }
@@ -302,10 +303,9 @@ int send_and_recv(void)
         return -1;
     }
     socket_fd sock(raw);
-    /* A server that stops reading must not block us either. */
-    const timeval send_limit{ISNS_RECV_DEADLINE_MS / 1000, 0};
-    setsockopt(sock.get(), SOL_SOCKET, SO_SNDTIMEO, &send_limit, sizeof send_limit);
-    const ssize_t sent = send(sock.get(), isns_pdu_buf, total, MSG_NOSIGNAL);
+    /* Never blocks: a request (at most 10000 bytes) fits a fresh socket's
+     * send buffer, and a server that stops reading must not hold us. */
+    const ssize_t sent = send(sock.get(), isns_pdu_buf, total, MSG_NOSIGNAL | MSG_DONTWAIT);
     if (isns_trace)
         printf("sent %d bytes\n", static_cast<int>(sent));
 

@@ -61,28 +61,6 @@ TEST(IsnsEncoding, StringsArePaddedWithTheirNul)
     EXPECT_EQ(built(), want);
 }
 
-TEST(IsnsEncoding, FixedSizeAttributes)
-{
-    emit_hdr(2);
-    emit_entity_protocol(0x102);  // only the low byte is sent
-    emit_iscsi_node_type(1);
-    emit_null_iscsi_node_type();
-    emit_pg_tag(0x01020304);
-    emit_port(0, 3260);
-    emit_port(1, 3261);
-    emit_null_addr();
-    emit_null_port();
-    emit_delimiter();
-    unsigned char a[16];
-    portal_addr("192.168.1.10", a);
-    emit_addr(1, a);
-    const bytes want = header(2, 0) + isns_attr_u32(2, 2) + isns_attr_u32(33, 1) + isns_attr_raw(33, {}) +
-                       isns_attr_u32(51, 0x01020304) + isns_attr_u32(17, 3260) + isns_attr_u32(50, 3261) +
-                       isns_attr_raw(16, {}) + isns_attr_raw(17, {}) + isns_attr_raw(0, {}) +
-                       isns_attr_raw(49, {0, 0, 0, 0, 0, 0, 0, 0, 0, 0, 0xff, 0xff, 0xc0, 0xa8, 0x01, 0x0a});
-    EXPECT_EQ(built(), want);
-}
-
 TEST(IsnsEncoding, DeregistrationIsTheKnown56Bytes)
 {
     bytes req = request_of("127.10.1.1", [] { return deregister_entity("iqn.x:t1"); });

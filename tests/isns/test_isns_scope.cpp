@@ -53,6 +53,21 @@ bool make_namespace(const std::vector<std::string> &ifaces)
     return true;
 }
 
+// The kernel adds each interface's fe80::/64 route a little after the link
+// comes up; measuring before that would see instant failures, not time-outs.
+bool wait_routes(const std::vector<std::string> &ifaces, const std::string &holder)
+{
+    for (int i = 0; i < 250; i++) {
+        bool all = holder.empty() || sh("ip -6 route show table local dev " + holder + " | grep -q '^local fe80::1 '");
+        for (const std::string &dev : ifaces)
+            all = all && sh("ip -6 route show dev " + dev + " | grep -q '^fe80::/64'");
+        if (all)
+            return true;
+        usleep(20 * 1000);
+    }
+    return false;
+}
+
 // In the child: server on fe80::1 held by `holder` (none: ""), connect, and
 // compare the scope used and the time taken. Returns 0 when as expected.
 int scope_case(const std::vector<std::string> &ifaces, const std::string &holder, const std::string &want_scope,
@@ -76,6 +91,10 @@ int scope_case(const std::vector<std::string> &ifaces, const std::string &holder
             std::fprintf(stderr, "skip: cannot listen on fe80::1%%%s\n", holder.c_str());
             return kSkip;
         }
+    }
+    if (!wait_routes(ifaces, holder)) {
+        std::fprintf(stderr, "link-local routes did not appear within 5 s\n");
+        return 1;
     }
     const auto t0 = std::chrono::steady_clock::now();
     int fd = -1;
