@@ -25,6 +25,7 @@ done
 check "loopback up, IPv4" ip -4 addr show dev lo scope host
 check "loopback up, IPv6" ip -6 addr show dev lo
 check "dummy0 has a usable link-local address" sh -c "ip -6 addr show dev dummy0 scope link | grep fe80 | grep -vq tentative"
+check "dummy0 has an IPv4 address for AI_ADDRCONFIG" sh -c "ip -4 addr show dev dummy0 | grep -q 'inet 192.0.2.1/24'"
 check "no network device but lo and dummy0" test "$(ls /sys/class/net | sort | tr '\n' ' ')" = "dummy0 lo "
 check "the real root: no system root set" test -z "${NESRAD_SYSROOT:-}"
 check "busybox tools the driver runs" sh -c 'command -v insmod && command -v rmmod && command -v mount'

@@ -231,9 +231,9 @@ void hand_made_acl(const std::string &tpg, const std::string &initiator, bool ma
     }
 }
 
-// Removes the ACLs and LUNs of a portal group the way the kernel accepts:
-// mapping links, then the mapped-LUN and ACL directories, then each LUN's
-// backstore link and directory. Returns whether nothing is left.
+// Removes the ACLs and LUNs of a portal group by hand, in the order the
+// kernel accepts: mapping links, mapped-LUN and ACL directories, then each
+// LUN's backstore link and directory. Returns whether nothing is left.
 bool unmake_acls_and_luns(const std::string &tpg)
 {
     for (const std::string &acl : subdirs(tpg + "/acls")) {
@@ -263,17 +263,16 @@ bool unmake_acls_and_luns(const std::string &tpg)
 }
 
 // Leaves the machine with no target module loaded and nothing in configfs,
-// whatever a test left behind: the driver's stop, after removing by hand
-// what its stop cannot (see StopIsRefusedWhileAnAclRemains).
+// whatever a test left behind: the driver's stop, then by hand (a failure).
 void force_stopped()
 {
+    if (lio3_stop_module() == 0 && loaded_target_modules().empty())
+        return;
+    ADD_FAILURE() << "the driver's stop left modules behind; removing them by hand";
     for (const std::string &iqn : subdirs(kIscsi))
         for (const std::string &tpg : subdirs(kIscsi + "/" + iqn))
             if (tpg.rfind("tpgt_", 0) == 0)
                 unmake_acls_and_luns(kIscsi + "/" + iqn + "/" + tpg);
-    if (lio3_stop_module() == 0 && loaded_target_modules().empty())
-        return;
-    ADD_FAILURE() << "the driver's stop left modules behind; removing them by hand";
     ::system("cd /sys/kernel/config/target 2>/dev/null && {"
              " rmdir iscsi/*/tpgt_*/np/* iscsi/*/tpgt_* iscsi/* core/fileio_*/* core/fileio_* iscsi; } 2>/dev/null;"
              " rmmod iscsi_target_mod; rmmod target_core_file; rmmod target_core_mod");
@@ -318,22 +317,24 @@ TEST_F(LioModules, StopLeavesNoModuleAndConfigfsMounted)
     EXPECT_EQ(iscsi_mod_get_state(), 0);
 }
 
-TEST_F(LioModules, StopTearsDownTargetsAndBackstoresTheKernelHolds)
+TEST_F(LioModules, StopTearsDownEverythingTheKernelHolds)
 {
     ASSERT_EQ(iscsi_mod_start(), 0);
     Target t = make_target("iqn.2026-01.vm:stop-full", 1);
     ASSERT_EQ(lio3_add_target(t.get()), 0);
     want_portal(t.get(), "127.0.0.1", "::1", 3260);
     ASSERT_EQ(lio3_set_target_ip(t.get()), 0);
+    hand_made_lun(tpg_dir(t.get()), "stopdisk");
+    hand_made_acl(tpg_dir(t.get()), "iqn.2026-01.vm:init-stop", true);
     ASSERT_EQ(lio3_enable_target(t.get()), 0);
     Target second = make_target("iqn.2026-01.vm:stop-second", 2);
     ASSERT_EQ(lio3_add_target(second.get()), 0);
-    const std::string disk = kCore + "/fileio_3/stopdisk";
-    ASSERT_EQ(::system(("mkdir -p " + disk).c_str()), 0);
-    ASSERT_EQ(poke(disk + "/control", "fd_dev_name=/tmp/stopdisk.img,fd_dev_size=1048576"), 0);
-    ASSERT_EQ(poke(disk + "/enable", "1"), 0);
+    const std::string spare = kCore + "/fileio_3/sparedisk"; // a backstore mapped nowhere
+    ASSERT_EQ(::system(("mkdir -p " + spare).c_str()), 0);
+    ASSERT_EQ(poke(spare + "/control", "fd_dev_name=/tmp/sparedisk.img,fd_dev_size=1048576"), 0);
+    ASSERT_EQ(poke(spare + "/enable", "1"), 0);
     // With configuration present the kernel refuses to unload the modules,
-    // so the driver must have emptied configfs first.
+    // so the driver must have emptied configfs first, in an order it accepts.
     ASSERT_NE(::system("rmmod iscsi_target_mod 2>/dev/null"), 0);
 
     EXPECT_EQ(iscsi_mod_stop(), 0);
@@ -342,29 +343,6 @@ TEST_F(LioModules, StopTearsDownTargetsAndBackstoresTheKernelHolds)
     EXPECT_FALSE(exists(kIscsi));
     EXPECT_FALSE(exists(kCore)) << "target_core_mod gone with its tree";
     EXPECT_FALSE(kernel_listens(3260, false));
-}
-
-TEST_F(LioModules, StopIsRefusedWhileAnAclRemains)
-{
-    // Target deletion removes ACLs with "rm -rf", which configfs refuses
-    // (attribute files cannot be unlinked): the portal group stays, and with
-    // it iscsi_target_mod, which the kernel will not unload while in use.
-    ASSERT_EQ(iscsi_mod_start(), 0);
-    Target t = make_target("iqn.2026-01.vm:stop-acl", 1);
-    ASSERT_EQ(lio3_add_target(t.get()), 0);
-    want_portal(t.get(), "127.0.0.1", "", 3260);
-    ASSERT_EQ(lio3_set_target_ip(t.get()), 0);
-    hand_made_acl(tpg_dir(t.get()), "iqn.2026-01.vm:init-stop");
-
-    EXPECT_EQ(iscsi_mod_stop(), ERR_MODULE_REMOVE);
-    EXPECT_TRUE(module_loaded("iscsi_target_mod"));
-    EXPECT_TRUE(exists(tpg_dir(t.get()) + "/acls/iqn.2026-01.vm:init-stop"));
-    EXPECT_EQ(subdirs(tpg_dir(t.get()) + "/np"), std::vector<std::string>{}) << "portals went first";
-
-    // Once the ACL is gone the same stop succeeds.
-    ASSERT_TRUE(unmake_acls_and_luns(tpg_dir(t.get())));
-    EXPECT_EQ(iscsi_mod_stop(), 0);
-    EXPECT_TRUE(loaded_target_modules().empty());
 }
 
 TEST_F(LioModules, StartMountsConfigfsWhenNothingIsMounted)
@@ -423,8 +401,6 @@ protected:
     void TearDown() override
     {
         if (exists(kIscsi + "/" + t_->iqn)) {
-            // What deletion cannot remove on this kernel (see the test below).
-            unmake_acls_and_luns(tpg_);
             EXPECT_EQ(lio3_del_target(t_.get()), 0) << "left-over target could not be deleted";
         }
     }
@@ -686,11 +662,8 @@ TEST_F(LioTarget, DeleteTearsDownAnEnabledTargetWithItsPortals)
     EXPECT_EQ(lio3_del_target(t_.get()), 0) << "already removed";
 }
 
-TEST_F(LioTarget, DeleteWithAclsAndLunsIsRefusedByTheKernel)
+TEST_F(LioTarget, DeleteRemovesAclsAndLunsInAnOrderTheKernelAccepts)
 {
-    // ACLs and LUNs are removed with "rm -rf", which configfs answers with
-    // EPERM on their attribute files and so leaves whole; the portal group
-    // then cannot be removed. Disabling and the portals are done by then.
     ASSERT_EQ(lio3_add_target(t_.get()), 0);
     want_portal(t_.get(), "127.0.0.1", "", 3260);
     ASSERT_EQ(lio3_set_target_ip(t_.get()), 0);
@@ -698,27 +671,22 @@ TEST_F(LioTarget, DeleteWithAclsAndLunsIsRefusedByTheKernel)
     hand_made_acl(tpg_, "iqn.2026-01.vm:init-f", true);
     hand_made_acl(tpg_, "iqn.2026-01.vm:init-g");
     ASSERT_EQ(lio3_enable_target(t_.get()), 0);
+    // The backstore is in use while the LUN links to it.
+    ASSERT_EQ(::rmdir((kCore + "/fileio_0/deldisk").c_str()), -1);
 
-    EXPECT_EQ(lio3_del_target(t_.get()), ERR_CONFIGFS);
-
-    EXPECT_EQ(attr("enable"), "0\n");
-    EXPECT_EQ(subdirs(tpg_ + "/np"), std::vector<std::string>{});
-    EXPECT_EQ(subdirs(tpg_ + "/acls"), (std::vector<std::string>{"iqn.2026-01.vm:init-f", "iqn.2026-01.vm:init-g"}));
-    EXPECT_EQ(subdirs(tpg_ + "/lun"), std::vector<std::string>{"lun_0"});
-
-    // Explicit removal in the kernel's order clears the way; deletion then works.
-    ASSERT_TRUE(unmake_acls_and_luns(tpg_));
     EXPECT_EQ(lio3_del_target(t_.get()), 0);
+
     EXPECT_FALSE(exists(kIscsi + "/" + t_->iqn));
-    EXPECT_TRUE(exists(kCore + "/fileio_0/deldisk")) << "backstores outlive their targets";
+    // Backstores outlive their targets, unlinked: the kernel now lets them go.
+    EXPECT_TRUE(exists(kCore + "/fileio_0/deldisk/control"));
     EXPECT_EQ(::rmdir((kCore + "/fileio_0/deldisk").c_str()), 0);
     EXPECT_EQ(::rmdir((kCore + "/fileio_0").c_str()), 0);
 }
 
 TEST_F(LioTarget, RecursiveRemovalIsRefusedByConfigfs)
 {
-    // configfs attribute files cannot be unlinked, so "rm -rf" fails part-way:
-    // the driver reports the failure and the kernel keeps the whole target.
+    // configfs attribute files cannot be unlinked, so "rm -rf" (the forced
+    // removal) fails: the driver reports it and the kernel keeps the target.
     ASSERT_EQ(lio3_add_target(t_.get()), 0);
     want_portal(t_.get(), "127.0.0.1", "", 3260);
     ASSERT_EQ(lio3_set_target_ip(t_.get()), 0);
