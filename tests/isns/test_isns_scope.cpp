@@ -142,18 +142,18 @@ void expect_case(const std::vector<std::string> &ifaces, const std::string &hold
 
 TEST(IsnsLinkLocal, Bond0IsTriedFirstWhenPresent)
 {
-    expect_case({"bond0", "eth0", "eth1"}, "bond0", "bond0", 0.0, 0.5);
-    expect_case({"bond0", "eth0", "eth1"}, "eth0", "eth0", 0.9, 1.6);
-    expect_case({"bond0", "eth0", "eth1"}, "eth1", "eth1", 1.9, 2.6);
+    expect_case({"bond0", "eth0", "eth1"}, "bond0", "bond0", 0.0, 0.8);
+    expect_case({"bond0", "eth0", "eth1"}, "eth0", "eth0", 0.9, 1.9);
+    expect_case({"bond0", "eth0", "eth1"}, "eth1", "eth1", 1.9, 2.9);
 }
 
 TEST(IsnsLinkLocal, Bond0IsSkippedWhenAbsent)
 {
-    expect_case({"eth0", "eth1"}, "eth0", "eth0", 0.0, 0.5);
-    expect_case({"eth0", "eth1"}, "eth1", "eth1", 0.9, 1.6);
+    expect_case({"eth0", "eth1"}, "eth0", "eth0", 0.0, 0.8);
+    expect_case({"eth0", "eth1"}, "eth1", "eth1", 0.9, 1.9);
 }
 
 TEST(IsnsLinkLocal, NoScopeAnswersAfterOneSecondEach)
 {
-    expect_case({"bond0", "eth0", "eth1"}, "", "", 2.9, 3.6);
+    expect_case({"bond0", "eth0", "eth1"}, "", "", 2.9, 3.9);
 }

@@ -167,7 +167,7 @@ TEST(IsnsTimeLimits, SilentOrClosingServersFailPromptly)
     // Closing after half a header.
     auto early = check_against("127.10.3.1", whole(bytes{0, 1, 0x80, 0x02, 0, 4}));
     EXPECT_EQ(early.rc, -1);
-    EXPECT_LT(early.seconds, 0.5);
+    EXPECT_LT(early.seconds, 0.9);
     // Half a response, then silence.
     const bytes full = qry_rsp({kName});
     auto stalled = check_against("127.10.3.1", {bytes(full.begin(), full.begin() + 20), 0, 0, 4000});
@@ -194,7 +194,7 @@ TEST(IsnsTimeLimits, UnreachableServerFailsWithinTheConnectTimeout)
     reset_client("127.10.3.3");
     auto t0 = std::chrono::steady_clock::now();
     EXPECT_EQ(isns_check_registration(kName), -1);
-    EXPECT_LT(std::chrono::duration<double>(std::chrono::steady_clock::now() - t0).count(), 0.5);
+    EXPECT_LT(std::chrono::duration<double>(std::chrono::steady_clock::now() - t0).count(), 0.9);
 
     // A listener whose accept queue is full drops the handshake: the connect
     // has to time out.
