@@ -6,6 +6,7 @@
 #include <arpa/inet.h>
 #include <gtest/gtest.h>
 #include <sys/stat.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -605,6 +606,56 @@ TEST_F(LioTarget, ChapSwitchAndCredentialsReachEveryAcl)
     EXPECT_EQ(lio3_set_target_chap(t_.get()), 0);
     EXPECT_EQ(attr("attrib/authentication"), "0\n");
     EXPECT_EQ(attr("acls/iqn.2026-01.vm:init-a/auth/userid"), "vmuser\n");
+}
+
+// iscsi-inq's INQUIRY of LUN 0 as initiator, with "user%secret" or none:
+// 0 when the login and the command succeed.
+int login(const std::string &iqn, const std::string &initiator, const std::string &credentials)
+{
+    const std::string url = "iscsi://" + (credentials.empty() ? "" : credentials + "@") +
+                            "127.0.0.1:3260/" + iqn + "/0";
+    pid_t pid = ::fork();
+    if (pid == 0) {
+        int null = ::open("/dev/null", O_WRONLY);
+        ::dup2(null, 1);
+        ::dup2(null, 2);
+        ::execl("/usr/bin/iscsi-inq", "iscsi-inq", "-i", initiator.c_str(), url.c_str(), (char *)nullptr);
+        ::_exit(127);
+    }
+    int status = 0;
+    if (pid < 0 || ::waitpid(pid, &status, 0) != pid)
+        return -1;
+    return WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
+}
+
+TEST_F(LioTarget, ChapTheDriverSetsIsWhatTheKernelEnforcesAtLogin)
+{
+    if (!exists("/usr/bin/iscsi-inq"))
+        GTEST_SKIP() << "no iSCSI initiator in the VM (libiscsi-bin not installed on the host)";
+    const std::string init = "iqn.2026-01.vm:login-init";
+    ASSERT_EQ(lio3_add_target(t_.get()), 0);
+    want_portal(t_.get(), "127.0.0.1", "", 3260);
+    ASSERT_EQ(lio3_set_target_ip(t_.get()), 0);
+    hand_made_lun(tpg_, "logindisk");
+    hand_made_acl(tpg_, init, true);
+    ASSERT_EQ(lio3_enable_target(t_.get()), 0);
+    t_->chap = 1;
+    std::strcpy(t_->chap_user, "vmuser");
+    // Shell metacharacters reach the kernel as the secret itself.
+    std::strcpy(t_->chap_pass, "pa$(x)\"q`z;w1");
+    ASSERT_EQ(lio3_set_target_chap(t_.get()), 0);
+
+    EXPECT_EQ(login(t_->iqn, init, std::string("vmuser%") + t_->chap_pass), 0);
+    EXPECT_NE(login(t_->iqn, init, "vmuser%pa$(x)\"q`z;w2"), 0) << "a wrong secret gets in";
+    EXPECT_NE(login(t_->iqn, init, ""), 0) << "no secret gets in";
+
+    t_->chap = 0;
+    ASSERT_EQ(lio3_set_target_chap(t_.get()), 0);
+    EXPECT_EQ(login(t_->iqn, init, ""), 0) << "CHAP off, yet the login is refused";
+
+    ASSERT_EQ(lio3_del_target(t_.get()), 0) << "deletion with the session gone";
+    EXPECT_EQ(::rmdir((kCore + "/fileio_0/logindisk").c_str()), 0);
+    EXPECT_EQ(::rmdir((kCore + "/fileio_0").c_str()), 0);
 }
 
 TEST_F(LioTarget, InvalidChapSettingsChangeNothing)
