@@ -371,6 +371,28 @@ TEST_F(NesradInTheVm, SignalsPickUpTargetsAndPortalsChangedInTheKernel)
     set_portals("disk2", 2, shared_portals());
 }
 
+TEST_F(NesradInTheVm, ServerThatStartsLateOrLosesItsDataGetsEverythingAgain)
+{
+    // The test build of the daemon checks every 2 s instead of every minute.
+    srv_->stop();
+    daemon_process d(korv_test::nesrad_test_binary(), kServer);
+    ASSERT_TRUE(d.wait_for("server failed", 15s)) << d.output();
+    ASSERT_TRUE(srv_->start()) << srv_->error();
+    const std::set<std::string> want_nodes{iqn_of("disk1"), iqn_of("disk2"), iqn_of("disk3")};
+    EXPECT_TRUE(eventually([&] { return nodes(*srv_) == want_nodes; }, 15s))
+        << srv_->adm("--list nodes") << d.output();
+
+    ASSERT_TRUE(srv_->restart()) << srv_->error(); // in-memory database: empty again
+    EXPECT_TRUE(eventually([&] { return nodes(*srv_) == want_nodes; }, 15s))
+        << srv_->adm("--list nodes") << d.output();
+    const auto want_groups = expected_groups({{"disk1", 1}, {"disk2", 2}});
+    EXPECT_EQ(settled([&] { return portal_groups(*srv_, {{"disk1", 1}, {"disk2", 2}}); }, want_groups, 5s),
+              want_groups);
+
+    d.signal(SIGTERM);
+    EXPECT_EQ(d.wait_exit(10s), 0) << d.output();
+}
+
 TEST_F(NesradInTheVm, TargetOnPortalsTheEntityLacksIsRefusedByTheServer)
 {
     // Further targets are registered with portal groups only; their portals
