@@ -22,7 +22,8 @@
 namespace {
 
 constexpr const char *kConfigFile = "/etc/NAS_CFG/config.xml";
-// The appliance's persistent (flash-backed) configuration directory.
+// The configuration directory on the appliance's persistent (flash-backed)
+// partition, which is mounted at /usr/local.
 constexpr const char *kPersistDir = "/usr/local/config";
 
 // Reads a small text file whole; false when it cannot be read.
@@ -310,6 +311,8 @@ int LIB_CP_Config_To_MTD(int flag)
         DBG(0, "%s", err.c_str());
         return -1;
     }
+    // The directory is made on first use, its parent (the persistent
+    // partition) never: without it the copy would land on volatile storage.
     if (::mkdir(dir.c_str(), 0755) != 0 && errno != EEXIST) {
         DBG(0, "cannot create %s: %s", dir.c_str(), std::strerror(errno));
         return -1;

@@ -4,6 +4,7 @@
 #include <cerrno>
 #include <cstring>
 #include <fcntl.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 namespace xmldb {
@@ -91,6 +92,15 @@ bool write_file_atomic(const std::string &path, std::string_view content, std::s
     if (d.fd >= 0)
         ::fsync(d.fd);
     return true;
+}
+
+bool make_dirs(const std::string &dir)
+{
+    for (size_t i = 1; i <= dir.size(); ++i)
+        if (i == dir.size() || dir[i] == '/')
+            ::mkdir(dir.substr(0, i).c_str(), 0755);
+    struct stat st{};
+    return ::stat(dir.c_str(), &st) == 0 && S_ISDIR(st.st_mode);
 }
 
 }  // namespace xmldb

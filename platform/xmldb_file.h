@@ -16,6 +16,10 @@ bool write_file_atomic(const std::string &path, std::string_view content, std::s
 // Reads a whole file. False with err when it cannot be read.
 bool read_file(const std::string &path, std::string &out, std::string &err);
 
+// Creates dir and its missing parents (mode 0755). False when dir is not a
+// directory afterwards.
+bool make_dirs(const std::string &dir);
+
 }  // namespace xmldb
 
 #endif

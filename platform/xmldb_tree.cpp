@@ -95,13 +95,13 @@ void to_element(pugi::xml_node parent, const Tree::Node &n)
 
 bool from_element(pugi::xml_node e, Tree::Node &into, size_t depth, std::string &err)
 {
-    if (depth > kDepthMax) {
-        err = "nesting deeper than " + std::to_string(kDepthMax) + " levels";
-        return false;
-    }
     for (pugi::xml_node c = e.first_child(); c; c = c.next_sibling()) {
         if (c.type() != pugi::node_element)
             continue;
+        if (depth > kDepthMax) {
+            err = "nesting deeper than " + std::to_string(kDepthMax) + " levels";
+            return false;
+        }
         std::string_view name = c.name();
         if (name == "node") {
             pugi::xml_attribute a = c.attribute("name");

@@ -6,6 +6,7 @@
 #include "platform/xmldb_tree.h"
 #include "platform/xmldbc.h"
 
+#include <algorithm>
 #include <cerrno>
 #include <climits>
 #include <cstdarg>
@@ -13,6 +14,7 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <dirent.h>
 #include <fcntl.h>
 #include <getopt.h>
 #include <memory>
@@ -27,6 +29,7 @@
 namespace {
 
 constexpr size_t kMaxClients = 256;
+constexpr size_t kOutHigh = 256 * 1024;  // answers queued per client before its requests wait
 constexpr const char *kDefaultAllowDir = "/etc/NAS_CFG";
 
 volatile sig_atomic_t g_stop = 0;
@@ -109,20 +112,33 @@ int parse_args(int argc, char **argv, Options &o)
     return 0;
 }
 
-void mkdirs(const std::string &dir)
-{
-    for (size_t i = 1; i <= dir.size(); ++i) {
-        if (i == dir.size() || dir[i] == '/')
-            ::mkdir(dir.substr(0, i).c_str(), 0755);
-    }
-}
-
 std::string parent_of(const std::string &p)
 {
     size_t s = p.rfind('/');
     if (s == std::string::npos)
         return ".";
     return s == 0 ? "/" : p.substr(0, s);
+}
+
+// Removes temporaries that saves of `file` left behind when their writer died.
+void remove_stale_temporaries(const std::string &file)
+{
+    std::string dir = parent_of(file);
+    std::string prefix = file.substr(file.rfind('/') + 1) + ".tmp.";
+    DIR *d = ::opendir(dir.c_str());
+    if (!d)
+        return;
+    while (dirent *e = ::readdir(d)) {
+        std::string_view name = e->d_name;
+        if (name.substr(0, prefix.size()) != prefix)
+            continue;
+        std::string_view pid = name.substr(prefix.size());
+        if (pid.empty() || pid.find_first_not_of("0123456789") != std::string_view::npos || pid.size() > 9)
+            continue;
+        if (::kill(std::atoi(std::string(pid).c_str()), 0) != 0 && errno == ESRCH)
+            ::unlink((dir + "/" + std::string(name)).c_str());
+    }
+    ::closedir(d);
 }
 
 class Service {
@@ -137,6 +153,7 @@ private:
         std::string out;
         size_t out_off = 0;
         bool closing = false;  // flush out, then close
+        uint64_t last_active = 0;
     };
 
     bool listen_socket();
@@ -152,6 +169,7 @@ private:
     int lfd_ = -1;
     ino_t sock_ino_ = 0;
     std::vector<std::unique_ptr<Conn>> conns_;
+    uint64_t tick_ = 0;
 };
 
 bool Service::listen_socket()
@@ -163,7 +181,7 @@ bool Service::listen_socket()
         return false;
     }
     std::memcpy(sa.sun_path, opt_.socket.c_str(), opt_.socket.size() + 1);
-    mkdirs(parent_of(opt_.socket));
+    xmldb::make_dirs(parent_of(opt_.socket));
 
     struct stat st{};
     if (::lstat(opt_.socket.c_str(), &st) == 0) {
@@ -206,10 +224,15 @@ void Service::accept_all()
         if (fd < 0)
             return;
         if (conns_.size() >= kMaxClients) {
-            ::close(fd);  // the client sees end of stream and fails its call
-            continue;
+            // Make room by hanging up on the longest idle client: a library
+            // client reconnects on its next call, a hoarder loses its slot.
+            auto lru = std::min_element(conns_.begin(), conns_.end(), [](const auto &a, const auto &b) {
+                return a->last_active < b->last_active;
+            });
+            ::close((*lru)->fd);
+            conns_.erase(lru);
         }
-        conns_.push_back(std::make_unique<Conn>(Conn{fd, {}, {}, 0, false}));
+        conns_.push_back(std::make_unique<Conn>(Conn{fd, {}, {}, 0, false, ++tick_}));
     }
 }
 
@@ -223,6 +246,7 @@ bool Service::read_conn(Conn &c)
     if (n < 0)
         return errno == EAGAIN || errno == EWOULDBLOCK || errno == EINTR;
     c.in.append(buf, static_cast<size_t>(n));
+    c.last_active = ++tick_;
     handle_frames(c);
     return true;
 }
@@ -243,7 +267,9 @@ bool Service::write_conn(Conn &c)
 void Service::handle_frames(Conn &c)
 {
     size_t off = 0;
-    while (!c.closing && c.in.size() - off >= xmldb::kHeaderSize) {
+    // Answers queue up to a bound: a client that pipelines big requests
+    // without reading gets no more work done until it drains its answers.
+    while (!c.closing && c.out.size() < kOutHigh && c.in.size() - off >= xmldb::kHeaderSize) {
         uint32_t len = xmldb::load_be32(reinterpret_cast<const unsigned char *>(c.in.data() + off));
         if (len == 0 || len > xmldb::kRequestMax) {
             // The stream cannot be resynchronised: answer once, then hang up.
@@ -354,8 +380,10 @@ int Service::run()
             return 1;
         }
     }
+    if (!opt_.load.empty())
+        remove_stale_temporaries(opt_.load);
     for (const auto &d : opt_.allow_dirs)
-        mkdirs(d);
+        xmldb::make_dirs(d);
     if (!listen_socket())
         return 1;
     if (opt_.ready_fd >= 0) {
@@ -395,6 +423,11 @@ int Service::run()
             }
             if (keep && !c.out.empty())
                 keep = write_conn(c);  // most answers go out at once
+            if (keep && c.out.empty() && !c.in.empty()) {
+                handle_frames(c);  // requests held back while answers were pending
+                if (!c.out.empty())
+                    keep = write_conn(c);
+            }
             if (!keep) {
                 ::close(c.fd);
                 c.fd = -1;

@@ -1,0 +1,235 @@
+// The platform utility calls: database shortcuts on a real service, the shell
+// runner and escaping, string helpers, and queries of a fake /proc and /sys.
+#include "platform/platform_util.h"
+#include "platform/xmldbc.h"
+#include "tests/support/xmldbd_fixture.h"
+
+#include <cstdint>
+#include <cstdlib>
+#include <cstring>
+#include <gtest/gtest.h>
+#include <set>
+#include <string>
+#include <unistd.h>
+#include <vector>
+
+using korv_test::SysRoot;
+using korv_test::XmldbService;
+
+TEST(PlatformDb, IntegersAndStrings)
+{
+    XmldbService db;
+    EXPECT_EQ(dbGetLL("/system_mgr/iscsi/enable"), 0);
+    ASSERT_EQ(dbSetLL(1, "/system_mgr/iscsi/enable"), 0);
+    EXPECT_EQ(dbGetLL("/system_mgr/iscsi/enable"), 1);
+    ASSERT_EQ(dbSetLL(-1099511627776LL, "/n"), 0);
+    EXPECT_EQ(dbGetLL("/n"), -1099511627776LL);
+    ASSERT_EQ(dbSetStr("12abc", "/n"), 0);
+    EXPECT_EQ(dbGetLL("/n"), 12);
+    ASSERT_EQ(dbSetStr("abc", "/n"), 0);
+    EXPECT_EQ(dbGetLL("/n"), 0);
+    ASSERT_EQ(dbSetStr("99999999999999999999", "/n"), 0);
+    EXPECT_EQ(dbGetLL("/n"), 0);
+
+    char buf[6];
+    ASSERT_EQ(dbSetStr("192.168.1.10", "/system_mgr/iscsi/iSNS/ip"), 0);
+    EXPECT_EQ(dbGetStr(buf, sizeof buf, "/system_mgr/iscsi/iSNS/ip"), 0);
+    EXPECT_STREQ(buf, "192.1");
+    EXPECT_EQ(dbGetStr(buf, 0, "/system_mgr/iscsi/iSNS/ip"), -1);
+    EXPECT_EQ(dbGetStr(nullptr, 6, "/system_mgr/iscsi/iSNS/ip"), -1);
+
+    ASSERT_EQ(dbSetLL(1234, "/system_mgr/iscsi/iSNS/pid"), 0);
+    EXPECT_EQ(dbDelete("/system_mgr/iscsi/iSNS"), 0);
+    EXPECT_EQ(dbGetLL("/system_mgr/iscsi/iSNS/pid"), 0);
+    EXPECT_EQ(dbGetStr(buf, sizeof buf, "/system_mgr/iscsi/iSNS/ip"), 0);
+    EXPECT_STREQ(buf, "");
+    EXPECT_EQ(dbGetLL("/system_mgr/iscsi/enable"), 1);
+    EXPECT_EQ(dbDelete("/system_mgr/iscsi/iSNS"), 0);
+
+    db.stop();
+    std::strcpy(buf, "old");
+    EXPECT_EQ(dbGetStr(buf, sizeof buf, "/system_mgr/iscsi/enable"), -1);
+    EXPECT_STREQ(buf, "");
+    EXPECT_EQ(dbGetLL("/system_mgr/iscsi/enable"), 0);
+    EXPECT_EQ(dbSetLL(1, "/x"), -1);
+    EXPECT_EQ(dbSetStr("v", "/x"), -1);
+    EXPECT_EQ(dbDelete("/x"), -1);
+}
+
+TEST(PlatformSystem, ReturnsTheShellStatus)
+{
+    EXPECT_EQ(System("exit %d", 0), 0);
+    EXPECT_EQ(System("exit %d", 3), 3);
+    EXPECT_EQ(System("exit 255"), 255);
+    EXPECT_EQ(System("kill -9 $$"), 128 + 9);
+    EXPECT_EQ(System("true; %s", "false"), 1);
+    EXPECT_EQ(System(nullptr), -1);
+}
+
+TEST(PlatformSystem, EscapedValuesStayDataInsideDoubleQuotes)
+{
+    const std::string canary = SysRoot::file("/canary");
+    const std::vector<std::string> hostile = {
+        "plain",
+        "$(touch " + canary + ")",
+        "`touch " + canary + "`",
+        "a\"; touch " + canary + "; echo \"",
+        "back\\slash\\",
+        "$HOME ${PATH} $$",
+        "tab\tnew\nline 'single'",
+        "",
+    };
+    const std::string out = SysRoot::file("/echo-out");
+    for (const auto &v : hostile) {
+        char *esc = str_insert_back_slash(v.c_str());
+        ASSERT_NE(esc, nullptr);
+        EXPECT_EQ(System("printf '%%s' \"%s\" > %s", esc, out.c_str()), 0) << v;
+        std::free(esc);
+        EXPECT_EQ(SysRoot::read("/echo-out"), v);
+    }
+    EXPECT_NE(::access(canary.c_str(), F_OK), 0) << "a value ran as a command";
+
+    char *e = str_insert_back_slash("a$b\"c\\d`e");
+    EXPECT_STREQ(e, "a\\$b\\\"c\\\\d\\`e");
+    std::free(e);
+    EXPECT_EQ(str_insert_back_slash(nullptr), nullptr);
+}
+
+TEST(PlatformStrings, Str2llIsStrict)
+{
+    long long v = 77;
+    EXPECT_EQ(str2ll("42", &v), 0);
+    EXPECT_EQ(v, 42);
+    EXPECT_EQ(str2ll("  -9223372036854775808", &v), 0);
+    EXPECT_EQ(v, INT64_MIN);
+    EXPECT_EQ(str2ll("1000\n", &v), 0);  // as read from a /sys file
+    EXPECT_EQ(v, 1000);
+    v = 5;
+    for (const char *bad : {"", "   ", "12abc", "abc", "9223372036854775808", "1 2", "0x10"})
+        EXPECT_EQ(str2ll(bad, &v), -1) << bad;
+    EXPECT_EQ(v, 5) << "a failed parse must not touch the value";
+    EXPECT_EQ(str2ll(nullptr, &v), -1);
+    EXPECT_EQ(str2ll("1", nullptr), -1);
+}
+
+TEST(PlatformStrings, StrsepExCollapsesSeparatorRuns)
+{
+    char text[] = "  sda,, sdb \t sdc  ";
+    char *p = text;
+    std::vector<std::string> tokens;
+    while (char *t = strsep_ex(&p, " ,\t"))
+        tokens.emplace_back(t);
+    EXPECT_EQ(tokens, (std::vector<std::string>{"sda", "sdb", "sdc"}));
+    EXPECT_EQ(p, nullptr);
+
+    char one[] = "only";
+    p = one;
+    EXPECT_STREQ(strsep_ex(&p, " "), "only");
+    EXPECT_EQ(strsep_ex(&p, " "), nullptr);
+    char none[] = "   ";
+    p = none;
+    EXPECT_EQ(strsep_ex(&p, " "), nullptr);
+    EXPECT_EQ(strsep_ex(nullptr, " "), nullptr);
+}
+
+TEST(PlatformQueries, MountPointsFromMountinfo)
+{
+    SysRoot::write("/proc/self/mountinfo",
+                   "22 1 0:21 / /sys rw,nosuid shared:7 - sysfs sysfs rw\n"
+                   "36 22 0:30 / /sys/kernel/config rw,relatime shared:13 - configfs configfs rw\n"
+                   "40 1 9:1 / /mnt/Volume\\0401 rw shared:20 - ext4 /dev/md1 rw\n"
+                   "garbage line\n");
+    const char *p = "/sys/kernel/config";
+    EXPECT_EQ(sys_mount_point(p), p);
+    EXPECT_NE(sys_mount_point("/sys/kernel/config/"), nullptr);
+    EXPECT_NE(sys_mount_point("/mnt/Volume 1"), nullptr);
+    EXPECT_EQ(sys_mount_point("/sys/kernel"), nullptr);
+    EXPECT_EQ(sys_mount_point("/mnt/Volume\\0401"), nullptr);
+    EXPECT_EQ(sys_mount_point("relative"), nullptr);
+    EXPECT_EQ(sys_mount_point(nullptr), nullptr);
+    SysRoot::remove("/proc/self/mountinfo");
+    EXPECT_EQ(sys_mount_point(p), nullptr);
+}
+
+TEST(PlatformQueries, HostName)
+{
+    SysRoot::write("/proc/sys/kernel/hostname", "My_Host01\n");
+    char buf[16];
+    EXPECT_EQ(sys_hostname(buf, sizeof buf), 0);
+    EXPECT_STREQ(buf, "My_Host01");
+    char tight[9];
+    EXPECT_EQ(sys_hostname(tight, sizeof tight), -1);  // never a cut name
+    EXPECT_STREQ(tight, "");
+    EXPECT_EQ(sys_hostname(buf, 0), -1);
+    SysRoot::remove("/proc/sys/kernel/hostname");
+    EXPECT_EQ(sys_hostname(buf, sizeof buf), -1);
+}
+
+TEST(PlatformQueries, MacAddress)
+{
+    SysRoot::write("/sys/class/net/egiga0/address", "00:14:Fd:1a:2B:ff\n");
+    const unsigned char *m = sys_get_mac_addr("egiga0");
+    ASSERT_NE(m, nullptr);
+    const unsigned char want[6] = {0x00, 0x14, 0xfd, 0x1a, 0x2b, 0xff};
+    EXPECT_EQ(std::memcmp(m, want, 6), 0);
+
+    for (const char *bad : {"00:14:fd:1a:2b", "00:14:fd:1a:2b:ff:00", "00-14-fd-1a-2b-ff", "zz:14:fd:1a:2b:ff", ""}) {
+        SysRoot::write("/sys/class/net/bad0/address", std::string(bad) + "\n");
+        EXPECT_EQ(sys_get_mac_addr("bad0"), nullptr) << bad;
+    }
+    EXPECT_EQ(sys_get_mac_addr("absent0"), nullptr);
+    EXPECT_EQ(sys_get_mac_addr("../../../sys/class/net/egiga0"), nullptr);
+    EXPECT_EQ(sys_get_mac_addr(""), nullptr);
+    EXPECT_EQ(sys_get_mac_addr(nullptr), nullptr);
+}
+
+TEST(PlatformQueries, LanLinkSpeed)
+{
+    SysRoot::write("/sys/class/net/egiga0/operstate", "up\n");
+    SysRoot::write("/sys/class/net/egiga0/speed", "1000\n");
+    SysRoot::write("/sys/class/net/egiga1/operstate", "down\n");
+    SysRoot::write("/sys/class/net/egiga1/speed", "100\n");
+    EXPECT_EQ(LIB_Get_Lan_Link_Speed(0), 1000);
+    EXPECT_EQ(LIB_Get_Lan_Link_Speed(1), 0);
+    EXPECT_EQ(LIB_Get_Lan_Link_Speed(2), 0);
+    EXPECT_EQ(LIB_Get_Lan_Link_Speed(-1), 0);
+    SysRoot::write("/sys/class/net/egiga1/operstate", "up\n");
+    SysRoot::write("/sys/class/net/egiga1/speed", "-1\n");  // what some drivers report without a link
+    EXPECT_EQ(LIB_Get_Lan_Link_Speed(1), 0);
+    SysRoot::write("/sys/class/net/egiga1/speed", "10000\n");
+    EXPECT_EQ(LIB_Get_Lan_Link_Speed(1), 10000);
+    SysRoot::remove("/sys/class/net/egiga0");
+    EXPECT_EQ(LIB_Get_Lan_Link_Speed(0), 0);
+}
+
+TEST(PlatformQueries, RandomNumbersAreNonNegativeAndVary)
+{
+    std::set<int> seen;
+    for (int i = 0; i < 16; ++i) {
+        int r = sys_random();
+        EXPECT_GE(r, 0);
+        seen.insert(r);
+    }
+    EXPECT_GT(seen.size(), 8u);
+}
+
+TEST(PlatformPersist, SavedConfigurationIsCopiedWhole)
+{
+    SysRoot::remove("/usr/local");
+    SysRoot::remove("/etc/NAS_CFG/config.xml");
+    SysRoot::mkdirs("/usr/local");
+    EXPECT_EQ(LIB_CP_Config_To_MTD(1), -1);  // nothing saved yet
+
+    XmldbService db;
+    ASSERT_EQ(dbSetStr("persisted", "/iscsi/target/id:1/name"), 0);
+    ASSERT_EQ(xml_write_file("/etc/NAS_CFG/config.xml"), 0);
+    ASSERT_EQ(LIB_CP_Config_To_MTD(1), 0);
+    std::string copy = SysRoot::read("/usr/local/config/config.xml");
+    EXPECT_EQ(copy, SysRoot::read("/etc/NAS_CFG/config.xml"));
+    EXPECT_NE(copy.find("persisted"), std::string::npos);
+
+    // Without the persistent partition nothing is written anywhere.
+    SysRoot::remove("/usr/local");
+    EXPECT_EQ(LIB_CP_Config_To_MTD(1), -1);
+    EXPECT_NE(::access(SysRoot::file("/usr/local").c_str(), F_OK), 0);
+}
