@@ -886,7 +886,7 @@ int lio3_add_target(iscsi_target_t *target)
     }
     if (rc != 0) {
         DBG(0, "lio3_add_target failed, rc = %d", rc);
-        configfs_rmdir_recursive(iqn_dir(target->iqn).c_str());
+        remove_configfs_group(iqn_dir(target->iqn));
         remove_dir_recurive(alua.c_str());
         return rc;
     }
@@ -1335,7 +1335,8 @@ int _lio3_shutdown_all_hba(void)
             continue;
         std::string hba = core + "/" + name;
         if (name.find("fileio") == std::string::npos) {
-            configfs_rmdir_recursive(hba.c_str());
+            if (remove_configfs_group(hba) != 0)
+                DBG(0, "can not remove hba entry : %s", hba.c_str());
             continue;
         }
         int hba_id = -1;

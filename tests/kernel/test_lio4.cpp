@@ -535,6 +535,14 @@ TEST_F(Lio4Test, AddingAnExistingTargetChangesNothing)
     EXPECT_FALSE(exists(at("/var/target/alua/iSCSI/") + IQN + "+1"));
 }
 
+TEST_F(Lio4Test, AddingATargetRollsBackWhenItsStateDirectoryCannotBeMade)
+{
+    iscsi_target_t *t = target();
+    write_file(at("/var/target"), "");  // a file where the directory belongs
+    EXPECT_EQ(lio3_add_target(t), ERR_CONFIGFS);
+    EXPECT_FALSE(exists(at("/sys/kernel/config/target/iscsi/") + IQN));
+}
+
 TEST_F(Lio4Test, TargetChecksComeFirst)
 {
     iscsi_target_t *t = target();
