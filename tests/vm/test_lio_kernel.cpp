@@ -439,6 +439,22 @@ TEST_F(LioTarget, AddingAnExistingTargetChangesNothing)
     EXPECT_EQ(attr("attrib/generate_node_acls"), "0\n");
 }
 
+TEST_F(LioTarget, AddRollsBackTheKernelsGroupsWhenItsStateDirectoryCannotBeMade)
+{
+    // A file where the ALUA state directory must go: the portal group is
+    // made in the kernel first, then must be taken down again group by group.
+    ASSERT_EQ(::rename("/var/target/alua", "/var/target/alua.saved"), 0);
+    { std::ofstream blocker("/var/target/alua"); }
+    int rc = lio3_add_target(t_.get());
+    ::unlink("/var/target/alua");
+    ASSERT_EQ(::rename("/var/target/alua.saved", "/var/target/alua"), 0);
+
+    EXPECT_EQ(rc, ERR_CONFIGFS);
+    EXPECT_FALSE(exists(kIscsi + "/" + t_->iqn)) << "the half-made target stayed in the kernel";
+    EXPECT_EQ(lio3_add_target(t_.get()), 0) << "and a second try works";
+    EXPECT_EQ(attr("attrib/generate_node_acls"), "1\n");
+}
+
 TEST_F(LioTarget, TagsTheKernelWouldAcceptAreRefused)
 {
     t_->tpgt = 64; // the kernel takes tpgt_64 and beyond; the appliance stops at 63
