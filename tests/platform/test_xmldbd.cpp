@@ -353,6 +353,7 @@ TEST(XmldbService, ShutsDownCleanlyAndGuardsItsSocket)
         ASSERT_EQ(::stat(sock.c_str(), &st), 0);
         db.restart();
         EXPECT_EQ(xmldbc_set(S, 0, "/k", "v"), 0);
+        EXPECT_EQ(db.stop(), 0);
     }
     EXPECT_NE(::access(sock.c_str(), F_OK), 0) << "SIGTERM should remove the socket";
 

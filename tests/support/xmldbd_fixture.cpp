@@ -188,22 +188,24 @@ void XmldbProcess::kill(int sig)
     pid_ = -1;
 }
 
-void XmldbProcess::stop()
+int XmldbProcess::stop()
 {
     if (pid_ <= 0)
-        return;
+        return -1;
     ::kill(pid_, SIGTERM);
     auto until = std::chrono::steady_clock::now() + std::chrono::seconds(5);
-    int st;
+    int st = 0;
     for (;;) {
         pid_t r = ::waitpid(pid_, &st, WNOHANG);
         if (r == pid_ || (r < 0 && errno != EINTR)) {
             pid_ = -1;
-            return;
+            if (r < 0)
+                return -1;
+            return WIFEXITED(st) ? WEXITSTATUS(st) : 128 + WTERMSIG(st);
         }
         if (std::chrono::steady_clock::now() > until) {
             kill(SIGKILL);  // a hung service must not hang the test
-            return;
+            return 128 + SIGKILL;
         }
         ::usleep(2000);
     }

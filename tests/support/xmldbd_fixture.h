@@ -52,8 +52,10 @@ public:
     // Starts the service (no-op when running); returns when it is serving.
     // Throws std::runtime_error when it does not come up within 10 s.
     void start();
-    // SIGTERM and wait; the service removes its socket.
-    void stop();
+    // SIGTERM and wait; the service removes its socket. Returns its exit
+    // status (128+N when killed by signal N, also after the 5 s grace
+    // SIGKILL), or -1 when it was not running.
+    int stop();
     // Sends sig (default SIGKILL; it must end the process) and reaps the
     // process; the socket stays behind.
     void kill(int sig = 9);
@@ -80,7 +82,7 @@ public:
 
     // Stops (SIGTERM) / kills (SIGKILL) / restarts the configuration service.
     // A restart begins with an empty tree unless load_file was given.
-    void stop() { config_.stop(); }
+    int stop() { return config_.stop(); }
     void kill() { config_.kill(); }
     void restart();
 
