@@ -348,6 +348,27 @@ bool wait_interval(const sigset_t *open_mask)
 // 0, or the exit status 1 after printing why.
 int resolve_server(const char *host)
 {
+    // A plain numeric address needs no lookup. Parsing it here gives what
+    // getaddrinfo would (one result of that family) without its result
+    // sorting, which enumerates interfaces and reads gai.conf and costs the
+    // daemon about 300 KiB of resident memory. Other forms (host names,
+    // scoped or abbreviated addresses) still go through getaddrinfo.
+    unsigned char raw_addr[sizeof(in6_addr)];
+    for (int family : {AF_INET, AF_INET6}) {
+        if (inet_pton(family, host, raw_addr) == 1) {
+            std::memset(isns_server_addr, 0, sizeof isns_server_addr);
+            if (!inet_ntop(family, raw_addr, isns_server_addr, sizeof isns_server_addr)) {
+                std::puts("get address failed");
+                std::fflush(stdout);
+                DBG(0, "inet_ntop failed");
+                return 1;
+            }
+            isns_addr_family = family;
+            DBG(1, "resolve address as %s", isns_server_addr);
+            return 0;
+        }
+    }
+
     addrinfo hints{};
     hints.ai_family = AF_UNSPEC;
     hints.ai_socktype = SOCK_STREAM;

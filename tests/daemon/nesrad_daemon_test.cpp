@@ -175,6 +175,21 @@ TEST_F(Appliance, BadArgumentsExitOneWithTheirMessages)
     EXPECT_LE(stored_pid(), 0) << "no failed start stores a pid";
 }
 
+TEST_F(Appliance, InstalledDaemonResolvesAHostName)
+{
+    // The installed daemon is linked statically: its host lookup must work.
+    store_targets(kEid, {});
+    daemon_process d(nesrad_binary(), "localhost");
+    ASSERT_TRUE(d.wait_for("resolve address as ", 5s)) << d.output();
+    std::string out = d.output();
+    EXPECT_TRUE(out.find("resolve address as 127.0.0.1\n") != std::string::npos ||
+                out.find("resolve address as ::1\n") != std::string::npos)
+        << out;
+    EXPECT_TRUE(eventually([&] { return stored_pid() == d.pid(); }, 5s));
+    // Without targets nothing goes to that server; the daemon is killed
+    // (not signalled) so that it stays that way.
+}
+
 TEST_F(Appliance, MissingHostNameIsAConfigurationFailure)
 {
     SysRoot::remove("/proc/sys/kernel/hostname");

@@ -1,0 +1,332 @@
+// Start-up cost and memory of nesrad with 64 targets, against its floor.
+//
+// One run makes a private system root (host name, 64 stored targets, each
+// with the same IPv4 and IPv6 kernel portals), starts xmldbd there and an
+// in-memory isnsd on 127.30.0.1, then times, alternating, N runs of:
+//   daemon  the installed nesrad from exec until its exit: start-up, the
+//           configuration read, 64 registrations, then the SIGTERM sent as
+//           soon as its handler is installed (held blocked until the daemon
+//           waits), one deregistration and the pid cleared: 65 exchanges;
+//   floor   this program re-executed in --floor mode: the same 65 exchanges,
+//           the same bytes (same encoder, names and portals), no
+//           configuration and no kernel reads;
+//   bare    a bare C++ program linked the way nesrad is (memory anchor);
+// and, in-process, the configuration read the daemon makes (context, debug
+// level, the 64 targets, two pid writes). A last daemon run checks that
+// isnsd really holds the 64 targets before the SIGTERM.
+//
+//   bench_nesrad [runs]     (default 20; needs isnsd and isnsadm)
+#include <arpa/inet.h>
+#include <fcntl.h>
+#include <signal.h>
+#include <sys/resource.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <chrono>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <fstream>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "common/korvadm_debug.h"
+#include "common/korvadm_log.h"
+#include "daemon/nesrad.h"
+#include "isns/isns_transport.h"
+#include "platform/platform_util.h"
+
+namespace {
+
+using clock_type = std::chrono::steady_clock;
+
+constexpr const char *kServer = "127.30.0.1";
+constexpr const char *kPrefix = "iqn.2026-01.org.example:";
+constexpr const char *kEid = "bench-nas";
+constexpr int kTargets = 64;
+const char *const kPortals[] = {"192.0.2.10:3260", "[2001:db8::10]:3260"};
+
+std::string g_root;
+
+[[noreturn]] void die(const std::string &why)
+{
+    std::fprintf(stderr, "bench_nesrad: %s\n", why.c_str());
+    std::exit(1);
+}
+
+std::string iqn_of(int i)
+{
+    return std::string(kPrefix) + kEid + ":t" + std::to_string(i);
+}
+
+void mkdirs(const std::string &dir)
+{
+    for (size_t i = 1; i <= dir.size(); ++i)
+        if (i == dir.size() || dir[i] == '/')
+            mkdir(dir.substr(0, i).c_str(), 0755);
+}
+
+struct child {
+    pid_t pid = -1;
+    clock_type::time_point start;
+};
+
+child spawn(const std::vector<std::string> &words, bool quiet = true)
+{
+    std::vector<char *> argv;
+    std::vector<std::string> w = words;
+    for (std::string &s : w)
+        argv.push_back(s.data());
+    argv.push_back(nullptr);
+    std::fflush(nullptr);
+    child c;
+    c.start = clock_type::now();
+    c.pid = fork();
+    if (c.pid == 0) {
+        if (quiet) {
+            int null = open("/dev/null", O_WRONLY);
+            dup2(null, 1);
+            dup2(null, 2);
+        }
+        execv(argv[0], argv.data());
+        _exit(127);
+    }
+    if (c.pid < 0)
+        die("fork failed");
+    return c;
+}
+
+struct outcome {
+    double ms;
+    long maxrss_kib;
+    int status;
+};
+
+outcome reap(const child &c)
+{
+    int status = 0;
+    rusage ru{};
+    if (wait4(c.pid, &status, 0, &ru) != c.pid)
+        die("wait4 failed");
+    double ms = std::chrono::duration<double, std::milli>(clock_type::now() - c.start).count();
+    return {ms, ru.ru_maxrss, WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status)};
+}
+
+// True once the process has a handler for SIGTERM (bit 15 of SigCgt).
+bool catches_sigterm(pid_t pid)
+{
+    std::ifstream in("/proc/" + std::to_string(pid) + "/status");
+    for (std::string line; std::getline(in, line);)
+        if (line.rfind("SigCgt:", 0) == 0)
+            return (std::strtoull(line.c_str() + 7, nullptr, 16) >> (SIGTERM - 1)) & 1;
+    return false;
+}
+
+long status_kib(pid_t pid, const char *field)
+{
+    std::ifstream in("/proc/" + std::to_string(pid) + "/status");
+    for (std::string line; std::getline(in, line);)
+        if (line.rfind(field, 0) == 0)
+            return std::atol(line.c_str() + std::strlen(field));
+    return -1;
+}
+
+// nesrad until its handler exists, then SIGTERM; or, with verify, until isnsd
+// holds every target (reported through *held and *hwm_kib) first.
+outcome run_daemon(const std::string &adm_conf, bool verify, int *held, long *hwm_kib)
+{
+    child c = spawn({NESRAD_BIN, kServer});
+    while (!catches_sigterm(c.pid)) {
+        if (waitpid(c.pid, nullptr, WNOHANG) == c.pid)
+            die("nesrad ended before installing its handler");
+        std::this_thread::sleep_for(std::chrono::microseconds(100));
+    }
+    if (verify) {
+        std::string cmd = "timeout 5 isnsadm -c " + adm_conf + " --local --list nodes | grep -c 'iSCSI name'";
+        for (int i = 0; i < 200 && *held < kTargets; ++i) {
+            std::this_thread::sleep_for(std::chrono::milliseconds(50));
+            FILE *p = popen(cmd.c_str(), "r");
+            if (p) {
+                if (std::fscanf(p, "%d", held) != 1)
+                    *held = 0;
+                pclose(p);
+            }
+        }
+        *hwm_kib = status_kib(c.pid, "VmHWM:");
+    }
+    kill(c.pid, SIGTERM);
+    return reap(c);
+}
+
+// --floor: the daemon's 65 exchanges from in-memory nodes.
+int floor_mode()
+{
+    std::snprintf(isns_server_addr, sizeof isns_server_addr, "%s", kServer);
+    isns_addr_family = AF_INET;
+    std::snprintf(isns_entity_id, sizeof isns_entity_id, "%s", kEid);
+    unsigned char v4[16], v6[16] = {};
+    ipv4_text_to_bytes(v4, "192.0.2.10");
+    inet_pton(AF_INET6, "2001:db8::10", v6);
+    for (int i = 1; i <= kTargets; ++i) {
+        isns_iscsi_node *node = isns_iscsi_node_new();
+        std::snprintf(node->name, sizeof node->name, "%s", iqn_of(i).c_str());
+        node->pg_tag = 1;
+        for (const unsigned char *a : {v4, v6}) {
+            isns_ip_portal *p = isns_ip_portal_new();
+            std::memcpy(p->address, a, 16);
+            p->port = 3260;
+            isns_iscsi_node_add_portal(node, p);
+        }
+        if (i == 1) {
+            std::snprintf(isns_entity_name, sizeof isns_entity_name, "%s", node->name);
+            register_entity(node);
+        } else {
+            register_node(node);
+        }
+        isns_iscsi_node_free(node);
+    }
+    return deregister_entity(isns_entity_name) == 0 ? 0 : 1;
+}
+
+double median(std::vector<double> v)
+{
+    std::sort(v.begin(), v.end());
+    return v[v.size() / 2];
+}
+
+double min_of(const std::vector<double> &v)
+{
+    return *std::min_element(v.begin(), v.end());
+}
+
+}  // namespace
+
+int main(int argc, char **argv)
+{
+    if (argc > 1 && std::strcmp(argv[1], "--floor") == 0)
+        return floor_mode();
+    int runs = argc > 1 ? std::atoi(argv[1]) : 20;
+    if (runs < 1)
+        die("usage: bench_nesrad [runs]");
+
+    char tmpl[] = "/tmp/nesrad-bench-XXXXXX";
+    if (!mkdtemp(tmpl))
+        die("mkdtemp failed");
+    g_root = tmpl;
+    setenv("NESRAD_SYSROOT", g_root.c_str(), 1);
+    mkdirs(g_root + "/proc/sys/kernel");
+    mkdirs(g_root + "/var/run");
+    mkdirs(g_root + "/etc/NAS_CFG");
+    std::ofstream(g_root + "/proc/sys/kernel/hostname") << "Bench_NAS\n";
+
+    // The configuration database service, ready when it writes a byte.
+    int ready[2];
+    if (pipe(ready) != 0)
+        die("pipe failed");
+    std::fflush(nullptr);
+    pid_t xmldbd = fork();
+    if (xmldbd == 0) {
+        close(ready[0]);
+        std::string fd = std::to_string(ready[1]);
+        execl(XMLDBD_BIN, XMLDBD_BIN, "--ready-fd", fd.c_str(), static_cast<char *>(nullptr));
+        _exit(127);
+    }
+    close(ready[1]);
+    char byte;
+    if (read(ready[0], &byte, 1) != 1)
+        die("xmldbd did not start");
+    close(ready[0]);
+
+    dbSetStr(kPrefix, "/iscsi/target/iqn_prefix");
+    dbSetLL(0, "/iscsi/target/dbg");
+    for (int i = 1; i <= kTargets; ++i) {
+        std::string base = "/iscsi/target/id:" + std::to_string(i) + "/";
+        dbSetStr(("t" + std::to_string(i)).c_str(), (base + "name").c_str());
+        dbSetLL(1, (base + "tpgt").c_str());
+        for (const char *np : kPortals)
+            mkdirs(g_root + "/sys/kernel/config/target/iscsi/" + iqn_of(i) + "/tpgt_1/np/" + np);
+    }
+    dbSetLL(kTargets, "/iscsi/target/count");
+
+    // The in-memory iSNS server.
+    std::string isns = g_root + "/isns";
+    mkdirs(isns);
+    std::ofstream(isns + "/isnsd.conf")
+        << "SourceName = " << kPrefix << "isns-bench\nBindAddress = " << kServer
+        << "\nPIDFile = " << isns << "/isnsd.pid\nControlSocket = " << isns
+        << "/isnsctl\nLocalRegistry = " << isns << "/isns.registry\nSecurity = 0\nSLPRegister = 0\n"
+        << "DefaultDiscoveryDomain = 1\nRegistrationPeriod = 0\nESIRetries = 0\n";
+    std::string adm_conf = isns + "/isnsadm.conf";
+    std::ofstream(adm_conf) << "SourceName = " << kPrefix << "isnsadm-bench\nControlSocket = " << isns
+                            << "/isnsctl\nSecurity = 0\n";
+    child isnsd = spawn({"/usr/sbin/isnsd", "-f", "-c", isns + "/isnsd.conf"});
+    std::this_thread::sleep_for(std::chrono::milliseconds(300));
+
+    // The configuration read of the daemon, in-process.
+    std::vector<double> conf_ms;
+    for (int r = 0; r < runs; ++r) {
+        auto t0 = clock_type::now();
+        iscsi_conf_init(&g_nesrad_conf);
+        dbg_get_conf_target_debug_lv(&g_nesrad_conf);
+        g_korv_debug_level = -1;  // keep the bench's own output clean
+        write_pid(1);
+        if (init_iqn_list() != kTargets)
+            die("the 64 targets do not read back");
+        write_pid(0);
+        conf_ms.push_back(std::chrono::duration<double, std::milli>(clock_type::now() - t0).count());
+        _iqn_clear();
+    }
+
+    std::vector<double> daemon_ms, floor_ms, bare_ms;
+    long daemon_rss = 0, floor_rss = 0, bare_rss = 0;
+    for (int r = 0; r < runs; ++r) {
+        int unused_held = 0;
+        long unused_hwm = 0;
+        outcome d = run_daemon(adm_conf, false, &unused_held, &unused_hwm);
+        if (d.status != 0)
+            die("nesrad exited with " + std::to_string(d.status));
+        daemon_ms.push_back(d.ms);
+        daemon_rss = std::max(daemon_rss, d.maxrss_kib);
+
+        outcome f = reap(spawn({"/proc/self/exe", "--floor"}));
+        if (f.status != 0)
+            die("the floor loop failed");
+        floor_ms.push_back(f.ms);
+        floor_rss = std::max(floor_rss, f.maxrss_kib);
+
+        outcome b = reap(spawn({NESRAD_BARE_BIN}));
+        bare_ms.push_back(b.ms);
+        bare_rss = std::max(bare_rss, b.maxrss_kib);
+    }
+    int held = 0;
+    long hwm = 0;
+    outcome v = run_daemon(adm_conf, true, &held, &hwm);
+
+    kill(isnsd.pid, SIGTERM);
+    reap(isnsd);
+    kill(xmldbd, SIGTERM);
+    waitpid(xmldbd, nullptr, 0);
+    std::system(("rm -rf '" + g_root + "'").c_str());
+
+    double goal = 1.5 * median(floor_ms) + median(conf_ms);
+    std::printf("runs: %d, %d targets, 2 portals each, in-memory isnsd on %s\n", runs, kTargets, kServer);
+    std::printf("%-44s %9s %9s %12s\n", "", "median", "min", "peak RSS");
+    std::printf("%-44s %7.2f ms %6.2f ms %8ld KiB\n", "nesrad: start to exit, 65 exchanges",
+                median(daemon_ms), min_of(daemon_ms), daemon_rss);
+    std::printf("%-44s %7.2f ms %6.2f ms %8ld KiB\n", "floor: same 65 exchanges, bare loop",
+                median(floor_ms), min_of(floor_ms), floor_rss);
+    std::printf("%-44s %7.2f ms %6.2f ms\n", "configuration read (in-process)", median(conf_ms),
+                min_of(conf_ms));
+    std::printf("%-44s %7.2f ms %6.2f ms %8ld KiB\n", "bare C++ program, linked as nesrad",
+                median(bare_ms), min_of(bare_ms), bare_rss);
+    std::printf("goal: nesrad median <= 1.5 x floor + configuration = %.2f ms: %s\n", goal,
+                median(daemon_ms) <= goal ? "met" : "NOT met");
+    std::printf("goal: nesrad peak RSS < 2048 KiB: %s\n", daemon_rss < 2048 ? "met" : "NOT met");
+    std::printf("check run: isnsd held %d of %d targets before SIGTERM (VmHWM %ld KiB), exit %d\n", held,
+                kTargets, hwm, v.status);
+    return held == kTargets && v.status == 0 ? 0 : 1;
+}
