@@ -177,6 +177,29 @@ TEST(XmldbBadInput, TruncatedAndStuckClientsDoNotStallOthers)
     EXPECT_EQ(half.answer()[0], xmldb::kOk);
 }
 
+TEST(XmldbBadInput, RandomFramesNeverTakeTheServiceDown)
+{
+    XmldbService db;
+    std::mt19937 rng(7);
+    for (int conn = 0; conn < 20; ++conn) {
+        RawClient c;
+        for (int i = 0; i < 25; ++i) {
+            // Well-framed but random inside: any op byte, any path length field.
+            std::string payload(1 + rng() % 64, '\0');
+            for (auto &ch : payload)
+                ch = static_cast<char>(rng());
+            if (!c.send(be32(static_cast<uint32_t>(payload.size())) + payload))
+                break;
+            std::string a = c.answer();
+            if (a.empty())
+                break;  // the service may hang up; it must not die
+            ASSERT_TRUE(a[0] == xmldb::kOk || a[0] == xmldb::kFail);
+        }
+    }
+    EXPECT_EQ(xmldbc_set(S, 0, "/alive", "yes"), 0);
+    EXPECT_EQ(get("/alive"), "yes");
+}
+
 TEST(XmldbBadInput, IdleConnectionHoardersCannotLockOthersOut)
 {
     XmldbService db;
