@@ -10,19 +10,21 @@
 
 namespace korv_test {
 
-std::string capture_stdout(const std::function<void()> &fn)
+namespace {
+std::string capture(std::FILE *stream, const std::function<void()> &fn)
 {
-    std::fflush(stdout);
+    std::fflush(stream);
     std::FILE *tmp = std::tmpfile();
     if (!tmp) {
         ADD_FAILURE() << "tmpfile failed";
         return {};
     }
-    int saved = dup(STDOUT_FILENO);
-    dup2(fileno(tmp), STDOUT_FILENO);
+    int fd = fileno(stream);
+    int saved = dup(fd);
+    dup2(fileno(tmp), fd);
     fn();
-    std::fflush(stdout);
-    dup2(saved, STDOUT_FILENO);
+    std::fflush(stream);
+    dup2(saved, fd);
     close(saved);
 
     std::string out;
@@ -34,6 +36,10 @@ std::string capture_stdout(const std::function<void()> &fn)
     std::fclose(tmp);
     return out;
 }
+}  // namespace
+
+std::string capture_stdout(const std::function<void()> &fn) { return capture(stdout, fn); }
+std::string capture_stderr(const std::function<void()> &fn) { return capture(stderr, fn); }
 
 int run_in_child(const std::function<int()> &fn)
 {

@@ -1,4 +1,4 @@
-// Capturing what a piece of code writes to standard output.
+// Capturing what a piece of code writes to standard output or error.
 #pragma once
 
 #include <functional>
@@ -9,6 +9,8 @@ namespace korv_test {
 // Runs fn with the process's standard output (fd 1 and stdout) redirected to
 // a temporary file and returns everything written.
 std::string capture_stdout(const std::function<void()> &fn);
+// The same for standard error (fd 2 and stderr).
+std::string capture_stderr(const std::function<void()> &fn);
 
 // Runs fn in a forked child and returns its exit status (or 128+signal).
 // Use it for code that reads process-wide state once (the system root).
