@@ -196,8 +196,8 @@ int ipv4_text_to_bytes(unsigned char out[16], const char *text)
 
 namespace {
 
-// Adds one portal of the given address text; false when it could not be
-// made (the caller decides whether that ends the whole address entry).
+// Adds one portal of the given address text; on failure the caller decides
+// whether that ends the whole address entry.
 enum class portal_rc { added, no_memory, bad_text };
 
 portal_rc add_portal(isns_iscsi_node *node, const char *text, int port, bool v6)
@@ -222,6 +222,23 @@ struct node_ptr {
     isns_iscsi_node *p = isns_iscsi_node_new();
     ~node_ptr() { isns_iscsi_node_free(p); }
 };
+
+// Builds the target's node and sends it: as the entity (whose name then
+// sources every later request) or as a further node of it.
+int register_target(const char *iqn, int tpgt, bool as_entity)
+{
+    node_ptr node;
+    if (get_iscsi_node_from_mod(node.p, iqn, tpgt) != 0)
+        return -1;
+    if (as_entity) {
+        copy_bounded(isns_entity_name, sizeof isns_entity_name, iqn);
+        register_entity(node.p);
+    } else {
+        DBG(1, "register iqn=%s", iqn);
+        register_node(node.p);
+    }
+    return 0;
+}
 
 }  // namespace
 
@@ -256,23 +273,13 @@ int get_iscsi_node_from_mod(isns_iscsi_node *node, const char *iqn, int tpgt)
 int target_register_entity_identifier(const char *iqn, int tpgt)
 {
     DBG(1, "register entity=%s", iqn ? iqn : "");
-    node_ptr node;
-    if (get_iscsi_node_from_mod(node.p, iqn, tpgt) != 0)
-        return -1;
-    copy_bounded(isns_entity_name, sizeof isns_entity_name, iqn);
-    register_entity(node.p);
-    return 0;
+    return register_target(iqn, tpgt, true);
 }
 
 int target_register_iSNS_single(const char *iqn, int tpgt)
 {
     DBG(1, "write tpginfo: iqn=%s", iqn ? iqn : "");
-    node_ptr node;
-    if (get_iscsi_node_from_mod(node.p, iqn, tpgt) != 0)
-        return -1;
-    DBG(1, "register iqn=%s", iqn);
-    register_node(node.p);
-    return 0;
+    return register_target(iqn, tpgt, false);
 }
 
 int target_register_iSNS_all(void)
@@ -311,6 +318,8 @@ int write_pid(int on)
 
 namespace {
 
+constexpr int kOurSignals[] = {SIGUSR1, SIGUSR2, SIGTERM};
+
 void on_signal(int sig)
 {
     g_pending_event = sig;
@@ -344,6 +353,22 @@ bool wait_interval(const sigset_t *open_mask)
     return false;
 }
 
+// Stores one resolved address in the transport's globals; 0, or the exit
+// status 1 after printing why.
+int store_server_addr(int family, const void *raw)
+{
+    std::memset(isns_server_addr, 0, sizeof isns_server_addr);
+    if (!inet_ntop(family, raw, isns_server_addr, sizeof isns_server_addr)) {
+        std::puts("get address failed");
+        std::fflush(stdout);
+        DBG(0, "inet_ntop failed");
+        return 1;
+    }
+    isns_addr_family = family;
+    DBG(1, "resolve address as %s", isns_server_addr);
+    return 0;
+}
+
 // Resolves the server once into the transport's address globals.
 // 0, or the exit status 1 after printing why.
 int resolve_server(const char *host)
@@ -354,20 +379,9 @@ int resolve_server(const char *host)
     // daemon about 300 KiB of resident memory. Other forms (host names,
     // scoped or abbreviated addresses) still go through getaddrinfo.
     unsigned char raw_addr[sizeof(in6_addr)];
-    for (int family : {AF_INET, AF_INET6}) {
-        if (inet_pton(family, host, raw_addr) == 1) {
-            std::memset(isns_server_addr, 0, sizeof isns_server_addr);
-            if (!inet_ntop(family, raw_addr, isns_server_addr, sizeof isns_server_addr)) {
-                std::puts("get address failed");
-                std::fflush(stdout);
-                DBG(0, "inet_ntop failed");
-                return 1;
-            }
-            isns_addr_family = family;
-            DBG(1, "resolve address as %s", isns_server_addr);
-            return 0;
-        }
-    }
+    for (int family : {AF_INET, AF_INET6})
+        if (inet_pton(family, host, raw_addr) == 1)
+            return store_server_addr(family, raw_addr);
 
     addrinfo hints{};
     hints.ai_family = AF_UNSPEC;
@@ -387,25 +401,13 @@ int resolve_server(const char *host)
                 res->ai_addrlen < sizeof addr ? res->ai_addrlen : sizeof addr);
     freeaddrinfo(res);
 
-    std::memset(isns_server_addr, 0, sizeof isns_server_addr);
-    const void *raw = nullptr;
     if (family == AF_INET)
-        raw = &reinterpret_cast<sockaddr_in *>(&addr)->sin_addr;
-    else if (family == AF_INET6)
-        raw = &reinterpret_cast<sockaddr_in6 *>(&addr)->sin6_addr;
-    else {
-        DBG(0, "get ip address failed");
-        return 1;
-    }
-    if (!inet_ntop(family, raw, isns_server_addr, sizeof isns_server_addr)) {
-        std::puts("get address failed");
-        std::fflush(stdout);
-        DBG(0, "inet_ntop failed");
-        return 1;
-    }
-    isns_addr_family = family;
-    DBG(1, "resolve address as %s", isns_server_addr);
-    return 0;
+        return store_server_addr(family, &reinterpret_cast<sockaddr_in *>(&addr)->sin_addr);
+    if (family == AF_INET6)
+        return store_server_addr(family, &reinterpret_cast<sockaddr_in6 *>(&addr)->sin6_addr);
+    std::memset(isns_server_addr, 0, sizeof isns_server_addr);
+    DBG(0, "get ip address failed");
+    return 1;
 }
 
 enum class wake { reload, stop };
@@ -418,12 +420,9 @@ wake wait_for_event(int count, const sigset_t *open_mask)
     for (;;) {
         switch (g_pending_event) {
         case SIGUSR1:
-            DBG(1, "Received event SIGUSR1(%d)", SIGUSR1);
-            g_pending_event = -1;
-            g_registered = 0;
-            return wake::reload;
         case SIGUSR2:
-            DBG(1, "Received event SIGUSR2(%d)", SIGUSR2);
+            DBG(1, "Received event %s(%d)", g_pending_event == SIGUSR1 ? "SIGUSR1" : "SIGUSR2",
+                static_cast<int>(g_pending_event));
             g_pending_event = -1;
             g_registered = 0;
             return wake::reload;
@@ -491,22 +490,17 @@ int nesrad_main(int argc, char **argv, unsigned poll_interval)
     // published: the management tool may signal as soon as it reads the pid.
     sigset_t ours, old_mask;
     sigemptyset(&ours);
-    sigaddset(&ours, SIGUSR1);
-    sigaddset(&ours, SIGUSR2);
-    sigaddset(&ours, SIGTERM);
+    for (int sig : kOurSignals)
+        sigaddset(&ours, sig);
     sigprocmask(SIG_BLOCK, &ours, &old_mask);
     sigset_t open_mask = old_mask;
-    sigdelset(&open_mask, SIGUSR1);
-    sigdelset(&open_mask, SIGUSR2);
-    sigdelset(&open_mask, SIGTERM);
-
     struct sigaction sa{};
     sa.sa_handler = on_signal;
     sigemptyset(&sa.sa_mask);
-    sa.sa_flags = 0;
-    sigaction(SIGUSR1, &sa, nullptr);
-    sigaction(SIGUSR2, &sa, nullptr);
-    sigaction(SIGTERM, &sa, nullptr);
+    for (int sig : kOurSignals) {
+        sigdelset(&open_mask, sig);
+        sigaction(sig, &sa, nullptr);
+    }
 
     write_pid(1);
 

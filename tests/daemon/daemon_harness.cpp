@@ -1,4 +1,4 @@
-// The appliance in a test root, and the daemon as a real process.
+// The appliance in a test root, the daemon as a real process, isnsadm's view.
 #include "tests/daemon/daemon_harness.h"
 
 #include <dirent.h>
@@ -11,11 +11,13 @@
 #include <cstdio>
 #include <cstdlib>
 #include <fstream>
+#include <map>
 #include <sstream>
 
 #include <gtest/gtest.h>
 
 #include "platform/platform_util.h"
+#include "tests/support/isns_isnsd.h"
 #include "tests/support/xmldbd_fixture.h"
 
 #ifndef NESRAD_BIN
@@ -28,17 +30,7 @@
 namespace korv_test {
 
 namespace {
-
 constexpr const char *kConfigfsIscsi = "/sys/kernel/config/target/iscsi";
-
-std::string read_file(const std::string &path)
-{
-    std::ifstream in(path);
-    std::stringstream ss;
-    ss << in.rdbuf();
-    return ss.str();
-}
-
 }  // namespace
 
 void set_host_name(const std::string &name)
@@ -56,7 +48,10 @@ void store_targets(const std::string &entity_id, const std::vector<target_spec> 
 {
     ASSERT_EQ(0, dbSetStr(kPrefix, "/iscsi/target/iqn_prefix"));
     ASSERT_EQ(0, dbSetLL(debug_level, "/iscsi/target/dbg"));
-    ASSERT_EQ(0, dbDelete("/iscsi/target/id"));
+    // The reader's walk ends only at an entry without a name: clear what an
+    // earlier call may have stored beyond the list.
+    for (size_t i = 1; i <= 64; ++i)
+        dbDelete(("/iscsi/target/id:" + std::to_string(i)).c_str());
     for (size_t i = 0; i < targets.size(); ++i) {
         std::string base = "/iscsi/target/id:" + std::to_string(i + 1) + "/";
         ASSERT_EQ(0, dbSetStr(targets[i].name.c_str(), (base + "name").c_str()));
@@ -64,21 +59,16 @@ void store_targets(const std::string &entity_id, const std::vector<target_spec> 
             ASSERT_EQ(0, dbSetLL(targets[i].tpgt, (base + "tpgt").c_str()));
         }
     }
-    // Entries beyond the list end the reader's walk only when their name is
-    // empty: clear what an earlier call may have stored.
-    for (size_t i = targets.size() + 1; i <= 64; ++i)
-        dbDelete(("/iscsi/target/id:" + std::to_string(i)).c_str());
     ASSERT_EQ(0, dbSetLL(static_cast<long long>(targets.size()), "/iscsi/target/count"));
 
     SysRoot::remove(kConfigfsIscsi);
     for (const target_spec &t : targets) {
-        if (!t.in_kernel)
-            continue;
-        std::string tpg = std::string(kConfigfsIscsi) + "/" + target_iqn(entity_id, t.name) +
-                          "/tpgt_" + std::to_string(t.tpgt);
-        SysRoot::mkdirs(tpg + "/np");
-        for (const std::string &np : t.portals)
-            SysRoot::mkdirs(tpg + "/np/" + np);
+        std::string np = std::string(kConfigfsIscsi) + "/" + target_iqn(entity_id, t.name) +
+                         "/tpgt_" + std::to_string(t.tpgt) + "/np";
+        if (t.in_kernel)
+            SysRoot::mkdirs(np);
+        for (const std::string &portal : t.in_kernel ? t.portals : std::vector<std::string>{})
+            SysRoot::mkdirs(np + "/" + portal);
     }
 }
 
@@ -92,6 +82,35 @@ long long stored_pid()
 
 std::string nesrad_binary() { return NESRAD_BIN; }
 std::string nesrad_test_binary() { return NESRAD_TEST_BIN; }
+
+std::set<std::string> isnsadm_rows(const isnsd_server &srv, const std::string &what,
+                                   std::initializer_list<const char *> keys)
+{
+    // isnsadm prints "Object N:" then "  0020  iSCSI name      : ... = value".
+    std::vector<std::map<std::string, std::string>> objects;
+    std::istringstream in(srv.adm("--list " + what));
+    for (std::string line; std::getline(in, line);) {
+        if (line.rfind("Object ", 0) == 0) {
+            objects.emplace_back();
+            continue;
+        }
+        size_t colon = line.find(": "), eq = line.find(" = ");
+        if (objects.empty() || colon == std::string::npos || eq == std::string::npos || eq < colon)
+            continue;
+        std::string value = line.substr(eq + 3);
+        if (value.size() >= 2 && value.front() == '"' && value.back() == '"')
+            value = value.substr(1, value.size() - 2);
+        objects.back()[line.substr(colon + 2, eq - colon - 2)] = value;
+    }
+    std::set<std::string> rows;
+    for (auto &o : objects) {
+        std::string row;
+        for (const char *k : keys)
+            row += (row.empty() ? "" : " ") + o[k];
+        rows.insert(row);
+    }
+    return rows;
+}
 
 daemon_process::daemon_process(const std::string &binary, const std::string &server,
                                std::vector<std::string> wrapper)
@@ -146,11 +165,8 @@ void daemon_process::signal(int sig) const
 
 int daemon_process::wait_exit(std::chrono::milliseconds limit)
 {
-    if (pid_ <= 0)
-        return -1;
     int status = 0;
-    bool done = eventually([&] { return waitpid(pid_, &status, WNOHANG) == pid_; }, limit);
-    if (!done)
+    if (pid_ <= 0 || !eventually([&] { return waitpid(pid_, &status, WNOHANG) == pid_; }, limit))
         return -1;
     pid_ = -1;
     return WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
@@ -158,7 +174,10 @@ int daemon_process::wait_exit(std::chrono::milliseconds limit)
 
 std::string daemon_process::output() const
 {
-    return read_file(log_);
+    std::ifstream in(log_);
+    std::stringstream ss;
+    ss << in.rdbuf();
+    return ss.str();
 }
 
 int daemon_process::count(const std::string &text) const
@@ -175,17 +194,28 @@ bool daemon_process::wait_for(const std::string &text, std::chrono::milliseconds
     return eventually([&] { return count(text) >= n; }, limit);
 }
 
+std::vector<std::chrono::steady_clock::time_point>
+daemon_process::arrivals(const std::string &text, int n, std::chrono::milliseconds limit) const
+{
+    std::vector<std::chrono::steady_clock::time_point> seen;
+    eventually(
+        [&] {
+            for (int c = count(text); static_cast<int>(seen.size()) < std::min(c, n);)
+                seen.push_back(std::chrono::steady_clock::now());
+            return static_cast<int>(seen.size()) >= n;
+        },
+        limit);
+    return seen;
+}
+
 int daemon_process::open_fds(int below) const
 {
-    if (pid_ <= 0)
-        return -1;
-    DIR *dir = opendir(("/proc/" + std::to_string(pid_) + "/fd").c_str());
+    DIR *dir = pid_ > 0 ? opendir(("/proc/" + std::to_string(pid_) + "/fd").c_str()) : nullptr;
     if (!dir)
         return -1;
     int n = 0;
     while (dirent *e = readdir(dir))
-        if (e->d_name[0] != '.' && std::atoi(e->d_name) < below)
-            ++n;
+        n += e->d_name[0] != '.' && std::atoi(e->d_name) < below;
     closedir(dir);
     return n;
 }

@@ -1,27 +1,31 @@
 // What the daemon's tests stand on: an appliance in the test's system root
-// (host name, stored targets and IQN prefix, the kernel's portal directories)
-// and the daemon run as a real process with its output in a file.
+// (host name, stored targets and IQN prefix, the kernel's portal directories),
+// the daemon run as a real process with its output in a file, and what an
+// isnsd holds as isnsadm lists it. The VM suite uses the process and listing
+// parts against the real root.
 #pragma once
 
 #include <sys/types.h>
+#include <time.h>
 
 #include <chrono>
+#include <initializer_list>
+#include <set>
 #include <string>
 #include <vector>
 
 namespace korv_test {
 
+class isnsd_server;
+
 // The IQN prefix the tests store; neutral domain.
 inline constexpr const char *kPrefix = "iqn.2026-01.org.example:";
 
-// Portal directory names as the kernel shows them under np/.
-inline constexpr const char *kPortalV4 = "192.0.2.10:3260";
-inline constexpr const char *kPortalV6 = "[2001:db8::10]:3260";
-
 struct target_spec {
     std::string name;
-    int tpgt = 1;
-    std::vector<std::string> portals{kPortalV4, kPortalV6};  // np/ entries
+    int tpgt = 1;  // < 0: stored without "tpgt"
+    // np/ entries as the kernel names them
+    std::vector<std::string> portals{"192.0.2.10:3260", "[2001:db8::10]:3260"};
     bool in_kernel = true;  // false: no configfs directory at all
 };
 
@@ -47,6 +51,11 @@ std::string nesrad_test_binary();
 // Interval of the test-only daemon, seconds.
 inline constexpr int kTestInterval = 2;
 
+// One row per object of `isnsadm --list <what>`: the values of `keys`,
+// joined by single spaces (quotes stripped).
+std::set<std::string> isnsadm_rows(const isnsd_server &srv, const std::string &what,
+                                   std::initializer_list<const char *> keys);
+
 class daemon_process {
 public:
     // Runs `binary server` (extra words before the argument, e.g. valgrind,
@@ -68,8 +77,12 @@ public:
     int count(const std::string &text) const;
     // Waits until the output holds `text` at least n times.
     bool wait_for(const std::string &text, std::chrono::milliseconds limit, int n = 1) const;
-    // Open descriptors of the running process; -1 when unreadable. With
-    // below set, only descriptors below it count (valgrind's own sit high).
+    // Waits for n occurrences of `text` and returns when each was first seen
+    // (fewer when the time ran out).
+    std::vector<std::chrono::steady_clock::time_point> arrivals(const std::string &text, int n,
+                                                                std::chrono::milliseconds limit) const;
+    // Open descriptors of the running process below `below` (valgrind's own
+    // sit high); -1 when unreadable.
     int open_fds(int below = 1 << 30) const;
 
 private:

@@ -2,14 +2,17 @@
 // faults and resources, against xmldbd in the test's root, a private isnsd
 // (or the fault server) on the test's own loopback address, and plain
 // portal directories standing for the kernel's.
+//
+// Periodic behaviour is judged on the mean spacing of several events, so a
+// loaded machine that delays one pass does not fail the test while a daemon
+// that checks twice as often or half as often still does.
 #include <signal.h>
 
 #include <atomic>
 #include <chrono>
 #include <memory>
-#include <map>
+#include <mutex>
 #include <set>
-#include <sstream>
 #include <string>
 #include <thread>
 #include <vector>
@@ -23,6 +26,7 @@
 
 using namespace korv_test;
 using namespace std::chrono_literals;
+using clock_type = std::chrono::steady_clock;
 
 namespace {
 
@@ -30,58 +34,7 @@ constexpr uint16_t ISNS_REG = 1, ISNS_QRY = 2, ISNS_DEREG = 4;
 constexpr auto kInterval = std::chrono::seconds(kTestInterval);
 const std::string kEid = "nas-box1";
 
-std::vector<target_spec> three_targets()
-{
-    return {{"t1", 1}, {"t2", 2}, {"t3", 3}};
-}
-
-// The objects isnsadm lists, each as its "name = value" lines.
-std::vector<std::map<std::string, std::string>> objects(const std::string &listing)
-{
-    std::vector<std::map<std::string, std::string>> out;
-    std::istringstream in(listing);
-    for (std::string line; std::getline(in, line);) {
-        if (line.rfind("Object ", 0) == 0) {
-            out.emplace_back();
-            continue;
-        }
-        size_t colon = line.find(": ");
-        size_t eq = line.find(" = ");
-        if (out.empty() || colon == std::string::npos || eq == std::string::npos || eq < colon)
-            continue;
-        std::string value = line.substr(eq + 3);
-        if (value.size() >= 2 && value.front() == '"' && value.back() == '"')
-            value = value.substr(1, value.size() - 2);
-        out.back()[line.substr(colon + 2, eq - colon - 2)] = value;
-    }
-    return out;
-}
-
-std::set<std::string> node_names(const isnsd_server &srv)
-{
-    std::set<std::string> names;
-    for (auto &o : objects(srv.adm("--list nodes")))
-        names.insert(o["iSCSI name"]);
-    return names;
-}
-
-std::set<std::string> entity_ids(const isnsd_server &srv)
-{
-    std::set<std::string> ids;
-    for (auto &o : objects(srv.adm("--list entities")))
-        ids.insert(o["Entity identifier"]);
-    return ids;
-}
-
-// "iqn address port tag" of every portal group.
-std::set<std::string> portal_groups(const isnsd_server &srv)
-{
-    std::set<std::string> pgs;
-    for (auto &o : objects(srv.adm("--list portal-groups")))
-        pgs.insert(o["Portal group name"] + " " + o["Portal group address"] + " " +
-                   o["Portal group port"] + " " + o["Portal group tag"]);
-    return pgs;
-}
+std::vector<target_spec> three_targets() { return {{"t1", 1}, {"t2", 2}, {"t3", 3}}; }
 
 std::set<std::string> iqns(const std::string &eid, std::initializer_list<const char *> targets)
 {
@@ -89,6 +42,29 @@ std::set<std::string> iqns(const std::string &eid, std::initializer_list<const c
     for (const char *t : targets)
         out.insert(target_iqn(eid, t));
     return out;
+}
+
+std::set<std::string> node_names(const isnsd_server &srv) { return isnsadm_rows(srv, "nodes", {"iSCSI name"}); }
+
+std::set<std::string> entity_ids(const isnsd_server &srv)
+{
+    return isnsadm_rows(srv, "entities", {"Entity identifier"});
+}
+
+// "iqn address port tag" of every portal group.
+std::set<std::string> portal_groups(const isnsd_server &srv)
+{
+    return isnsadm_rows(srv, "portal-groups",
+                        {"Portal group name", "Portal group address", "Portal group port", "Portal group tag"});
+}
+
+// Mean spacing of the events, to be compared with the interval.
+void expect_once_per_interval(const std::vector<clock_type::time_point> &at, size_t n)
+{
+    ASSERT_EQ(n, at.size()) << "events seen";
+    auto mean = (at.back() - at.front()) / static_cast<int>(n - 1);
+    EXPECT_GE(mean, kInterval * 3 / 4) << "faster than once per interval";
+    EXPECT_LE(mean, kInterval * 3 / 2) << "slower than once per interval";
 }
 
 // An appliance with its configuration service and host name NAS_Box1.
@@ -102,12 +78,18 @@ protected:
 // ... and a private isnsd on the test's own address.
 class WithIsnsd : public Appliance {
 protected:
-    void start_isnsd(const std::string &address)
+    void SetUp() override
     {
+        Appliance::SetUp();
         if (!isnsd_available())
             GTEST_SKIP() << "isnsd not installed";
+    }
+    void start_isnsd(const std::string &address, bool now = true)
+    {
         srv_ = std::make_unique<isnsd_server>(address);
-        ASSERT_TRUE(srv_->start()) << srv_->error();
+        if (now) {
+            ASSERT_TRUE(srv_->start()) << srv_->error();
+        }
     }
     bool holds(const std::set<std::string> &names, std::chrono::milliseconds limit)
     {
@@ -122,12 +104,12 @@ uint16_t func_of(const bytes &pdu)
     return pdu.size() >= 4 ? static_cast<uint16_t>(pdu[2] << 8 | pdu[3]) : 0;
 }
 
-int count_func(const std::vector<bytes> &reqs, uint16_t func)
+std::vector<uint16_t> funcs(const std::vector<bytes> &reqs)
 {
-    int n = 0;
+    std::vector<uint16_t> out;
     for (const bytes &r : reqs)
-        n += func_of(r) == func;
-    return n;
+        out.push_back(func_of(r));
+    return out;
 }
 
 // Answers like a server that takes no registration: DevAttrReg fails with
@@ -146,38 +128,39 @@ isns_fake_reply refusing_server(const bytes &req)
 
 /* ---- start-up ---- */
 
-TEST_F(Appliance, BadArgumentsExitOneWithTheirMessages)
+TEST_F(Appliance, BadArgumentsAndConfigurationExitOneWithTheirMessages)
 {
     store_targets(kEid, three_targets());
-    {
-        daemon_process d(nesrad_test_binary(), "");
-        EXPECT_EQ(1, d.wait_exit(5s));
-        EXPECT_NE(std::string::npos, d.output().find("isns host address not given"));
-    }
-    {
-        daemon_process d(nesrad_test_binary(), std::string(256, 'a'));
-        EXPECT_EQ(1, d.wait_exit(5s));
-        EXPECT_NE(std::string::npos, d.output().find("isns host address length exceed max len = 255\n"));
-    }
-    {
+    struct {
+        std::string arg, says, never;
+    } cases[] = {
+        {"", "isns host address not given", ""},
+        {std::string(256, 'a'), "isns host address length exceed max len = 255\n", ""},
         // 255 characters pass the length check and fail the lookup (a label
         // over 63 characters is refused without asking any name server).
-        daemon_process d(nesrad_test_binary(), std::string(255, 'a'));
-        EXPECT_EQ(1, d.wait_exit(5s));
-        EXPECT_EQ(std::string::npos, d.output().find("exceed")) << d.output();
-        EXPECT_NE(std::string::npos, d.output().find("getaddrinfo return")) << d.output();
-    }
-    {
-        daemon_process d(nesrad_test_binary(), "unresolvable..name");
-        EXPECT_EQ(1, d.wait_exit(5s));
-        EXPECT_NE(std::string::npos, d.output().find("getaddrinfo return")) << d.output();
+        {std::string(255, 'a'), "getaddrinfo return", "exceed"},
+        {"unresolvable..name", "getaddrinfo return", ""},
+    };
+    for (auto &c : cases) {
+        daemon_process d(nesrad_test_binary(), c.arg);
+        EXPECT_EQ(1, d.wait_exit(5s)) << c.arg.size();
+        EXPECT_NE(std::string::npos, d.output().find(c.says)) << d.output();
+        if (!c.never.empty()) {
+            EXPECT_EQ(std::string::npos, d.output().find(c.never)) << d.output();
+        }
     }
     EXPECT_LE(stored_pid(), 0) << "no failed start stores a pid";
+
+    SysRoot::remove("/proc/sys/kernel/hostname");
+    daemon_process d(nesrad_test_binary(), "127.20.1.1");
+    EXPECT_EQ(1, d.wait_exit(5s));
+    EXPECT_NE(std::string::npos, d.output().find("get config failed")) << d.output();
 }
 
 TEST_F(Appliance, InstalledDaemonResolvesAHostName)
 {
     // The installed daemon is linked statically: its host lookup must work.
+    // Without targets nothing goes to that server; the daemon is killed.
     store_targets(kEid, {});
     daemon_process d(nesrad_binary(), "localhost");
     ASSERT_TRUE(d.wait_for("resolve address as ", 5s)) << d.output();
@@ -186,32 +169,20 @@ TEST_F(Appliance, InstalledDaemonResolvesAHostName)
                 out.find("resolve address as ::1\n") != std::string::npos)
         << out;
     EXPECT_TRUE(eventually([&] { return stored_pid() == d.pid(); }, 5s));
-    // Without targets nothing goes to that server; the daemon is killed
-    // (not signalled) so that it stays that way.
 }
 
-TEST_F(Appliance, MissingHostNameIsAConfigurationFailure)
-{
-    SysRoot::remove("/proc/sys/kernel/hostname");
-    daemon_process d(nesrad_test_binary(), "127.20.1.1");
-    EXPECT_EQ(1, d.wait_exit(5s));
-    EXPECT_NE(std::string::npos, d.output().find("get config failed")) << d.output();
-}
-
-TEST_F(Appliance, UnreadableTargetsExit255WithThePidLeftStored)
+TEST_F(Appliance, UnreadableTargetsOrDatabaseExit255WithThePidLeftStored)
 {
     std::vector<target_spec> targets = three_targets();
     targets[1].tpgt = -1;  // stored without "tpgt"
     store_targets(kEid, targets);
-    daemon_process d(nesrad_test_binary(), "127.20.1.2");
-    pid_t pid = d.pid();
-    EXPECT_EQ(255, d.wait_exit(5s));
-    EXPECT_NE(std::string::npos, d.output().find("get target conf from config failed")) << d.output();
-    EXPECT_EQ(pid, stored_pid());
-}
-
-TEST_F(Appliance, UnreachableDatabaseExits255)
-{
+    {
+        daemon_process d(nesrad_test_binary(), "127.20.1.2");
+        pid_t pid = d.pid();
+        EXPECT_EQ(255, d.wait_exit(5s));
+        EXPECT_NE(std::string::npos, d.output().find("get target conf from config failed")) << d.output();
+        EXPECT_EQ(pid, stored_pid());
+    }
     store_targets(kEid, three_targets());
     db_.stop();
     daemon_process d(nesrad_test_binary(), "127.20.1.3");
@@ -239,22 +210,24 @@ TEST_F(WithIsnsd, RegistersEveryTargetWithItsPortalsAndTags)
     EXPECT_EQ(d.pid(), stored_pid());
 }
 
-TEST_F(WithIsnsd, PortalLessTargetInSecondPlaceIsRegisteredByName)
+TEST_F(WithIsnsd, FurtherTargetsWithoutPortalsOrWithForeignOnes)
 {
     start_isnsd("127.20.2.2");
-    std::vector<target_spec> targets = three_targets();
-    targets[1].portals.clear();
+    std::vector<target_spec> targets = {{"t1", 1}, {"t2", 2}, {"t3", 3}, {"t4", 4}};
+    targets[1].portals.clear();                   // registered by name
+    targets[2].portals = {"198.51.100.7:3260"};  // refused by the server
     store_targets(kEid, targets);
     daemon_process d(nesrad_test_binary(), "127.20.2.2");
-    ASSERT_TRUE(holds(iqns(kEid, {"t1", "t2", "t3"}), 5s)) << srv_->adm("--list nodes") << d.output();
-    // No portal group of ours for it (the server may make default ones,
-    // but never with the target's own tag 2).
+    ASSERT_TRUE(holds(iqns(kEid, {"t1", "t2", "t4"}), 5s)) << srv_->adm("--list nodes") << d.output();
+    // No portal group of ours for t2 (the server may make default ones, but
+    // never with the target's own tag 2).
     for (const std::string &pg : portal_groups(*srv_))
         EXPECT_FALSE(pg.rfind(target_iqn(kEid, "t2") + " ", 0) == 0 && pg.back() == '2') << pg;
-    EXPECT_EQ(1u, portal_groups(*srv_).count(target_iqn(kEid, "t3") + " 192.0.2.10 3260/tcp 3"));
+    EXPECT_EQ(1u, portal_groups(*srv_).count(target_iqn(kEid, "t4") + " 192.0.2.10 3260/tcp 4"));
     // The entity still answers the check: nothing is registered again.
     std::this_thread::sleep_for(2 * kInterval + 500ms);
     EXPECT_EQ(0, d.count("reinit")) << d.output();
+    EXPECT_EQ(iqns(kEid, {"t1", "t2", "t4"}), node_names(*srv_));
 }
 
 TEST_F(WithIsnsd, PortalLessFirstTargetIsRegisteredAgainEveryInterval)
@@ -266,22 +239,9 @@ TEST_F(WithIsnsd, PortalLessFirstTargetIsRegisteredAgainEveryInterval)
     daemon_process d(nesrad_test_binary(), "127.20.2.3");
     // Without portals the node type is dropped, so the check keyed on type
     // Target never finds the entity's node.
-    EXPECT_TRUE(d.wait_for("our data on server has been delete, reinit", 3 * kInterval + 2s, 2))
-        << d.output();
-    EXPECT_GE(d.count("register entity="), 3);
-    EXPECT_LE(d.count("register entity="), 5) << "once per interval, no faster";
-}
-
-TEST_F(WithIsnsd, FurtherTargetWithAForeignPortalIsMissing)
-{
-    start_isnsd("127.20.2.4");
-    std::vector<target_spec> targets = three_targets();
-    targets[2].portals = {"198.51.100.7:3260"};
-    store_targets(kEid, targets);
-    daemon_process d(nesrad_test_binary(), "127.20.2.4");
-    ASSERT_TRUE(holds(iqns(kEid, {"t1", "t2"}), 5s)) << srv_->adm("--list nodes") << d.output();
-    std::this_thread::sleep_for(500ms);
-    EXPECT_EQ(iqns(kEid, {"t1", "t2"}), node_names(*srv_));
+    // "):" ends the log prefix: not the "deregister entity=" lines.
+    expect_once_per_interval(d.arrivals("):register entity=", 5, 12 * kInterval), 5);
+    EXPECT_GE(d.count("our data on server has been delete, reinit"), 4) << d.output();
 }
 
 TEST_F(WithIsnsd, FirstTargetWhosePortalsCannotBeListedRegistersNoEntity)
@@ -302,42 +262,27 @@ TEST_F(WithIsnsd, FirstTargetWhosePortalsCannotBeListedRegistersNoEntity)
 
 /* ---- signals ---- */
 
-TEST_F(WithIsnsd, Sigusr1RegistersAnAddedTarget)
+TEST_F(WithIsnsd, SignalsOnTheInstalledDaemonReloadAndStop)
 {
     start_isnsd("127.20.3.1");
     std::vector<target_spec> targets = three_targets();
     store_targets(kEid, targets);
-    daemon_process d(nesrad_test_binary(), "127.20.3.1");
+    daemon_process d(nesrad_binary(), "127.20.3.1");
     ASSERT_TRUE(holds(iqns(kEid, {"t1", "t2", "t3"}), 5s)) << d.output();
+    EXPECT_EQ(d.pid(), stored_pid());
 
     targets.push_back({"t4", 4});
     store_targets(kEid, targets);
     d.signal(SIGUSR1);
     EXPECT_TRUE(holds(iqns(kEid, {"t1", "t2", "t3", "t4"}), 5s)) << d.output();
-    EXPECT_EQ(1, d.count("Received event SIGUSR1(10)"));
-}
-
-TEST_F(WithIsnsd, Sigusr2AfterAHostRenameRegistersUnderTheNewIdentifier)
-{
-    start_isnsd("127.20.3.2");
-    store_targets(kEid, three_targets());
-    daemon_process d(nesrad_test_binary(), "127.20.3.2");
-    ASSERT_TRUE(holds(iqns(kEid, {"t1", "t2", "t3"}), 5s)) << d.output();
 
     set_host_name("NAS_Box2");
     store_targets("nas-box2", three_targets());
     d.signal(SIGUSR2);
     EXPECT_TRUE(holds(iqns("nas-box2", {"t1", "t2", "t3"}), 5s)) << srv_->adm("--list nodes") << d.output();
     EXPECT_EQ(std::set<std::string>{"nas-box2"}, entity_ids(*srv_)) << "the old entity was deregistered";
-}
-
-TEST_F(WithIsnsd, SigtermOnTheInstalledDaemonDeregistersAndClearsThePid)
-{
-    start_isnsd("127.20.3.3");
-    store_targets(kEid, three_targets());
-    daemon_process d(nesrad_binary(), "127.20.3.3");
-    ASSERT_TRUE(holds(iqns(kEid, {"t1", "t2", "t3"}), 5s)) << d.output();
-    EXPECT_EQ(d.pid(), stored_pid());
+    EXPECT_EQ(1, d.count("Received event SIGUSR1(10)"));
+    EXPECT_EQ(1, d.count("Received event SIGUSR2(12)"));
 
     d.signal(SIGTERM);
     EXPECT_EQ(0, d.wait_exit(5s)) << d.output();
@@ -357,20 +302,19 @@ TEST_F(Appliance, WithoutTargetsOnlyEachSignalSendsOneEmptyDeregistration)
     std::this_thread::sleep_for(2 * kInterval + 500ms);
     EXPECT_TRUE(srv.requests().empty()) << "nothing is sent while waiting";
 
+    // Source attribute 32 of length 4, four zero bytes.
     const bytes empty_source = isns_attr_str(32, "");
-    ASSERT_EQ(12u, empty_source.size()) << "tag, length 4, four zero bytes";
-    int n = 0;
+    size_t n = 0;
     for (int sig : {SIGUSR1, SIGUSR2, SIGTERM}) {
         d.signal(sig);
         ++n;
-        ASSERT_TRUE(eventually([&] { return srv.requests().size() >= static_cast<size_t>(n); }, 3s));
+        ASSERT_TRUE(eventually([&] { return srv.requests().size() >= n; }, 5s));
         std::this_thread::sleep_for(300ms);
         std::vector<bytes> reqs = srv.requests();
-        ASSERT_EQ(static_cast<size_t>(n), reqs.size()) << "one request per signal";
-        const bytes &r = reqs.back();
-        EXPECT_EQ(ISNS_DEREG, func_of(r));
-        ASSERT_GE(r.size(), 24u);
-        EXPECT_EQ(empty_source, bytes(r.begin() + 12, r.begin() + 24));
+        ASSERT_EQ(n, reqs.size()) << "one request per signal";
+        EXPECT_EQ(ISNS_DEREG, func_of(reqs.back()));
+        ASSERT_GE(reqs.back().size(), 24u);
+        EXPECT_EQ(empty_source, bytes(reqs.back().begin() + 12, reqs.back().begin() + 24));
     }
     EXPECT_EQ(0, d.wait_exit(3s));
     EXPECT_EQ(0, stored_pid());
@@ -385,27 +329,20 @@ TEST_F(Appliance, SignalDuringAnExchangeIsActedOnRightAfterIt)
     std::atomic<int> regs{0};
     srv.set_handler([&](const bytes &req) {
         isns_fake_reply reply = refusing_server(req);
-        if (func_of(req) == ISNS_REG && regs++ == 0) {
-            reply.data = isns_pdu(0x8001, 0x4c00, {0, 0, 0, 0});
-            reply.chunk = 4;
-            reply.chunk_gap_ms = 300;
-        }
+        if (func_of(req) == ISNS_REG && regs++ == 0)
+            reply = {isns_pdu(0x8001, 0x4c00, {0, 0, 0, 0}), 4, 300};
         return reply;
     });
     // The installed daemon: its next check would be a minute away.
     daemon_process d(nesrad_binary(), "127.20.3.5");
     ASSERT_TRUE(eventually([&] { return !srv.requests().empty(); }, 5s)) << d.output();
-    auto sent = std::chrono::steady_clock::now();
     d.signal(SIGUSR1);
 
-    // Everything of the pass goes out, then the reload at once.
-    ASSERT_TRUE(eventually([&] { return count_func(srv.requests(), ISNS_DEREG) == 1; }, 5s)) << d.output();
-    EXPECT_LT(std::chrono::steady_clock::now() - sent, 4s);
-    std::vector<bytes> reqs = srv.requests();
-    ASSERT_GE(reqs.size(), 4u);
-    EXPECT_EQ((std::vector<uint16_t>{ISNS_REG, ISNS_REG, ISNS_REG, ISNS_DEREG}),
-              (std::vector<uint16_t>{func_of(reqs[0]), func_of(reqs[1]), func_of(reqs[2]), func_of(reqs[3])}));
-    ASSERT_TRUE(eventually([&] { return count_func(srv.requests(), ISNS_REG) == 6; }, 5s));
+    // Everything of the pass goes out, then at once the reload: one
+    // deregistration and the three registrations again.
+    ASSERT_TRUE(eventually([&] { return srv.requests().size() >= 7; }, 8s)) << d.output();
+    std::vector<uint16_t> want = {ISNS_REG, ISNS_REG, ISNS_REG, ISNS_DEREG, ISNS_REG, ISNS_REG, ISNS_REG};
+    EXPECT_EQ(want, funcs(srv.requests()));
 
     d.signal(SIGTERM);
     EXPECT_EQ(0, d.wait_exit(5s)) << d.output();
@@ -414,52 +351,59 @@ TEST_F(Appliance, SignalDuringAnExchangeIsActedOnRightAfterIt)
 
 /* ---- server faults ---- */
 
-TEST_F(WithIsnsd, ServerDownAtStartIsRegisteredAfterItsFirstAnswer)
+TEST_F(WithIsnsd, ServerDownAtStartOrRestartedEmptyGetsEverythingAgain)
 {
-    if (!isnsd_available())
-        GTEST_SKIP() << "isnsd not installed";
+    start_isnsd("127.20.4.1", false);
     store_targets(kEid, three_targets());
-    srv_ = std::make_unique<isnsd_server>("127.20.4.1");
     daemon_process d(nesrad_test_binary(), "127.20.4.1");
-    ASSERT_TRUE(d.wait_for("server failed", kInterval + 3s)) << d.output();
+    ASSERT_TRUE(d.wait_for("server failed", kInterval + 5s)) << d.output();
     ASSERT_TRUE(srv_->start()) << srv_->error();
-    EXPECT_TRUE(holds(iqns(kEid, {"t1", "t2", "t3"}), 2 * kInterval + 3s)) << d.output();
+    EXPECT_TRUE(holds(iqns(kEid, {"t1", "t2", "t3"}), 2 * kInterval + 5s)) << d.output();
     EXPECT_EQ(1, d.count("server is back, reinit"));
-}
 
-TEST_F(WithIsnsd, ServerRestartedEmptyGetsEverythingAgainWithinAnInterval)
-{
-    start_isnsd("127.20.4.2");
-    store_targets(kEid, three_targets());
-    daemon_process d(nesrad_test_binary(), "127.20.4.2");
-    ASSERT_TRUE(holds(iqns(kEid, {"t1", "t2", "t3"}), 5s)) << d.output();
+    // In-memory database: empty after the restart, filled again at the next
+    // check (which may also catch the server down and reload once it is back).
     ASSERT_TRUE(srv_->restart()) << srv_->error();
     EXPECT_TRUE(node_names(*srv_).empty());
-    EXPECT_TRUE(holds(iqns(kEid, {"t1", "t2", "t3"}), kInterval + 3s)) << d.output();
-    EXPECT_EQ(1, d.count("our data on server has been delete, reinit"));
+    EXPECT_TRUE(holds(iqns(kEid, {"t1", "t2", "t3"}), 2 * kInterval + 5s)) << d.output();
+    EXPECT_EQ(2, d.count("reinit")) << d.output();
     EXPECT_EQ(std::set<std::string>{kEid}, entity_ids(*srv_));
 }
 
 TEST_F(Appliance, RefusingServerGetsOneDeregistrationAndOneRegistrationPerInterval)
 {
     store_targets(kEid, {{"t1", 1}});
+    std::mutex mu;
+    std::vector<clock_type::time_point> reg_times;
     isns_fake_server srv("127.20.4.3");
     ASSERT_TRUE(srv.ok()) << srv.error();
-    srv.set_handler(refusing_server);
+    srv.set_handler([&](const bytes &req) {
+        if (func_of(req) == ISNS_REG) {
+            std::lock_guard<std::mutex> lock(mu);
+            reg_times.push_back(clock_type::now());
+        }
+        return refusing_server(req);
+    });
     daemon_process d(nesrad_test_binary(), "127.20.4.3");
-    ASSERT_TRUE(eventually([&] { return !srv.requests().empty(); }, 5s));
-    std::this_thread::sleep_for(3 * kInterval + kInterval / 2);
-
-    std::vector<bytes> reqs = srv.requests();
-    int regs = count_func(reqs, ISNS_REG), deregs = count_func(reqs, ISNS_DEREG);
-    int qrys = count_func(reqs, ISNS_QRY);
-    EXPECT_EQ(3, deregs) << "one per interval";
-    EXPECT_EQ(deregs + 1, regs);
-    EXPECT_EQ(deregs, qrys) << "each pass ends after exactly one check";
-    // Query, deregistration, registration: never two checks in one pass.
-    for (size_t i = 1; i + 2 < reqs.size(); i += 3)
+    auto regs_seen = [&] {
+        std::lock_guard<std::mutex> lock(mu);
+        return reg_times.size();
+    };
+    ASSERT_TRUE(eventually([&] { return regs_seen() >= 5; }, 12 * kInterval)) << d.output();
+    std::vector<uint16_t> got = funcs(srv.requests());
+    {
+        std::lock_guard<std::mutex> lock(mu);
+        expect_once_per_interval({reg_times.begin(), reg_times.begin() + 5}, 5);
+    }
+    // Registration, then per pass query, deregistration, registration: never
+    // two checks in one pass.
+    ASSERT_GE(got.size(), 13u);
+    EXPECT_EQ(ISNS_REG, got[0]);
+    for (size_t i = 1; i + 2 < got.size(); i += 3) {
         EXPECT_EQ((std::vector<uint16_t>{ISNS_QRY, ISNS_DEREG, ISNS_REG}),
-                  (std::vector<uint16_t>{func_of(reqs[i]), func_of(reqs[i + 1]), func_of(reqs[i + 2])}));
+                  (std::vector<uint16_t>{got[i], got[i + 1], got[i + 2]}))
+            << "pass " << (i + 2) / 3;
+    }
 }
 
 /* ---- resources ---- */
@@ -481,14 +425,20 @@ TEST_F(WithIsnsd, ManyReloadsLeakNothingAndKeepTheDescriptors)
     auto limit = 30s;
 #endif
     daemon_process d(nesrad_test_binary(), "127.20.5.1", wrapper);
-    ASSERT_TRUE(d.wait_for("register iqn=" + target_iqn(kEid, "t3"), limit)) << d.output();
-    int fds = d.open_fds(1024);
+    const std::string last = "register iqn=" + target_iqn(kEid, "t3");
+    // Descriptors are counted once the pass's last exchange is surely over.
+    auto idle_fds = [&] {
+        std::this_thread::sleep_for(500ms);
+        return d.open_fds(1024);
+    };
+    ASSERT_TRUE(d.wait_for(last, limit)) << d.output();
+    int fds = idle_fds();
     ASSERT_GT(fds, 0);
     for (int i = 2; i <= 21; ++i) {
         d.signal(i % 2 ? SIGUSR1 : SIGUSR2);
-        ASSERT_TRUE(d.wait_for("register iqn=" + target_iqn(kEid, "t3"), limit, i)) << d.output();
+        ASSERT_TRUE(d.wait_for(last, limit, i)) << d.output();
     }
-    EXPECT_EQ(fds, d.open_fds(1024));
+    EXPECT_EQ(fds, idle_fds());
     EXPECT_EQ(iqns(kEid, {"t1", "t2", "t3"}), node_names(*srv_));
     d.signal(SIGTERM);
     EXPECT_EQ(0, d.wait_exit(limit)) << d.output();

@@ -24,106 +24,16 @@ using namespace korv_test;
 
 namespace {
 
+const std::string kEid = "nas-box1";
+
 std::vector<std::string> listed()
 {
     std::vector<std::string> out;
     nesrad_node_t *rec = nullptr;
-    if (_iqn_next(nullptr, &rec) != 0)
-        return out;
-    for (; rec; rec = rec->next)
+    for (_iqn_next(nullptr, &rec); rec; rec = rec->next)
         out.push_back(std::string(rec->iqn) + "/" + std::to_string(rec->tpgt));
     return out;
 }
-
-struct NodeList : ::testing::Test {
-    void TearDown() override { _iqn_clear(); }
-};
-
-}  // namespace
-
-TEST_F(NodeList, KeepsInsertionOrderAndDuplicates)
-{
-    EXPECT_TRUE(listed().empty());
-    _iqn_add("iqn.a", 1);
-    _iqn_add("iqn.b", 2);
-    _iqn_add("iqn.a", 3);
-    EXPECT_EQ((std::vector<std::string>{"iqn.a/1", "iqn.b/2", "iqn.a/3"}), listed());
-    EXPECT_EQ(0, _iqn_query("iqn.b"));
-    EXPECT_EQ(-1, _iqn_query("iqn.c"));
-    EXPECT_EQ(-1, _iqn_query(nullptr));
-}
-
-TEST_F(NodeList, DeleteRemovesOnlyTheFirstMatch)
-{
-    _iqn_add("iqn.a", 1);
-    _iqn_add("iqn.b", 2);
-    _iqn_add("iqn.a", 3);
-    _iqn_del("iqn.a");
-    EXPECT_EQ((std::vector<std::string>{"iqn.b/2", "iqn.a/3"}), listed());
-    _iqn_del("iqn.absent");
-    _iqn_del(nullptr);
-    EXPECT_EQ(2u, listed().size());
-    _iqn_del("iqn.a");  // the tail
-    _iqn_del("iqn.b");  // the head, now alone
-    EXPECT_TRUE(listed().empty());
-}
-
-TEST_F(NodeList, NextWalksAndAnswersForTheEnds)
-{
-    nesrad_node_t *rec = reinterpret_cast<nesrad_node_t *>(1);
-    EXPECT_EQ(-1, _iqn_next(nullptr, &rec)) << "empty list has no head";
-    _iqn_add("iqn.a", 1);
-    _iqn_add("iqn.b", 2);
-    ASSERT_EQ(0, _iqn_next("iqn.a", &rec));
-    ASSERT_NE(nullptr, rec);
-    EXPECT_STREQ("iqn.b", rec->iqn);
-    EXPECT_EQ(0, _iqn_next("iqn.b", &rec)) << "the last record has a NULL successor";
-    EXPECT_EQ(nullptr, rec);
-    EXPECT_EQ(-1, _iqn_next("iqn.c", &rec));
-}
-
-TEST_F(NodeList, LongNamesAreCutAndClearEmpties)
-{
-    std::string long_iqn(300, 'q');
-    _iqn_add(long_iqn.c_str(), 7);
-    _iqn_add("iqn.b", 2);
-    nesrad_node_t *rec = nullptr;
-    ASSERT_EQ(0, _iqn_next(nullptr, &rec));
-    EXPECT_EQ(std::string(255, 'q'), rec->iqn);
-    EXPECT_EQ(0, _iqn_clear());
-    EXPECT_TRUE(listed().empty());
-    EXPECT_EQ(0, _iqn_clear());
-}
-
-TEST(ConvStr, LowersLettersAndTurnsUnderscoresIntoHyphens)
-{
-    char text[] = "NAS_Box1.Z-a_9";
-    EXPECT_EQ(0, conv_str(text));
-    EXPECT_STREQ("nas-box1.z-a-9", text);
-    EXPECT_EQ(-1, conv_str(nullptr));
-}
-
-TEST(Ipv4TextToBytes, GivesTheMappedForm)
-{
-    unsigned char b[16];
-    ASSERT_EQ(0, ipv4_text_to_bytes(b, "192.0.2.10"));
-    unsigned char want[16];
-    ASSERT_EQ(1, inet_pton(AF_INET6, "::ffff:192.0.2.10", want));
-    EXPECT_EQ(0, std::memcmp(want, b, 16));
-
-    for (const char *bad : {"1.2.3", "1.2.3.4.5", "", "1234"})
-        EXPECT_EQ(-1, ipv4_text_to_bytes(b, bad)) << bad;
-    EXPECT_EQ(-1, ipv4_text_to_bytes(b, nullptr));
-    // Huge parts keep their low byte instead of overflowing.
-    ASSERT_EQ(0, ipv4_text_to_bytes(b, "99999999999999999999.0.0.1"));
-    EXPECT_EQ(1, b[15]);
-}
-
-/* ---- against the test root: portals from the kernel tree, targets from the store ---- */
-
-namespace {
-
-const std::string kEid = "nas-box1";
 
 // The 16-byte form of an address text.
 bytes addr16(const char *text)
@@ -136,36 +46,32 @@ bytes addr16(const char *text)
     return bytes(b, b + 16);
 }
 
-std::set<std::pair<bytes, uint32_t>> portals_of(const isns_iscsi_node *node)
-{
-    std::set<std::pair<bytes, uint32_t>> out;
-    for (isns_ip_portal *p : korv::list_records<isns_ip_portal>(&node->portals))
-        out.insert({bytes(p->address, p->address + 16), p->port});
-    return out;
-}
-
-// Whether the PDU holds attribute tag with exactly this value (unpadded
-// values are compared on their first value.size() bytes).
+// Whether the PDU holds attribute `tag` whose value starts with `value`.
 bool has_attr(const bytes &pdu, uint32_t tag, const bytes &value)
 {
-    for (size_t p = 12; p + 8 <= pdu.size();) {
-        uint32_t t = uint32_t(pdu[p]) << 24 | pdu[p + 1] << 16 | pdu[p + 2] << 8 | pdu[p + 3];
-        uint32_t len = uint32_t(pdu[p + 4]) << 24 | pdu[p + 5] << 16 | pdu[p + 6] << 8 | pdu[p + 7];
+    auto be32 = [&](size_t p) { return uint32_t(pdu[p]) << 24 | pdu[p + 1] << 16 | pdu[p + 2] << 8 | pdu[p + 3]; };
+    for (size_t p = 12; p + 8 <= pdu.size(); p += 8 + be32(p + 4)) {
+        uint32_t len = be32(p + 4);
         if (p + 8 + len > pdu.size())
             return false;
-        if (t == tag && len >= value.size() && std::equal(value.begin(), value.end(), pdu.begin() + p + 8))
+        if (be32(p) == tag && len >= value.size() && std::equal(value.begin(), value.end(), pdu.begin() + p + 8))
             return true;
-        p += 8 + len;
     }
     return false;
 }
 
-bytes text_bytes(const std::string &s)
+// The request's first attribute, the source, is exactly this name.
+bool sourced_by(const bytes &pdu, const std::string &name)
 {
-    return bytes(s.begin(), s.end() + 0) + bytes{0};
+    bytes want = isns_attr_str(32, name);
+    return pdu.size() >= 12 + want.size() && std::equal(want.begin(), want.end(), pdu.begin() + 12);
 }
 
-class InRoot : public ::testing::Test {
+struct NodeList : ::testing::Test {
+    void TearDown() override { _iqn_clear(); }
+};
+
+class InRoot : public NodeList {
 protected:
     void SetUp() override
     {
@@ -173,78 +79,120 @@ protected:
         set_host_name("NAS_Box1");
         ASSERT_EQ(0, iscsi_mod_select(2));
     }
-    void TearDown() override { _iqn_clear(); }
 
     XmldbService db_;
 };
 
 }  // namespace
 
-TEST_F(InRoot, NodeGetsEveryKernelPortalOfItsTarget)
+TEST_F(NodeList, KeepsOrderAndDuplicatesAndDeletesTheFirstMatch)
 {
-    std::vector<target_spec> targets = {{"t1", 5}};
-    targets[0].portals.push_back("127.0.0.1:3261");
-    store_targets(kEid, targets);
-    std::string iqn = target_iqn(kEid, "t1");
+    nesrad_node_t *rec = reinterpret_cast<nesrad_node_t *>(1);
+    EXPECT_EQ(-1, _iqn_next(nullptr, &rec)) << "empty list has no head";
+    _iqn_add("iqn.a", 1);
+    _iqn_add("iqn.b", 2);
+    _iqn_add("iqn.a", 3);
+    _iqn_add(std::string(300, 'q').c_str(), 7);  // cut to 255
+    EXPECT_EQ((std::vector<std::string>{"iqn.a/1", "iqn.b/2", "iqn.a/3", std::string(255, 'q') + "/7"}), listed());
+    EXPECT_EQ(0, _iqn_query("iqn.b"));
+    EXPECT_EQ(-1, _iqn_query("iqn.c"));
+    EXPECT_EQ(-1, _iqn_query(nullptr));
 
-    isns_iscsi_node *node = isns_iscsi_node_new();
-    ASSERT_EQ(0, get_iscsi_node_from_mod(node, iqn.c_str(), 5));
-    EXPECT_EQ(iqn, node->name);
-    EXPECT_EQ(5u, node->pg_tag);
-    std::set<std::pair<bytes, uint32_t>> want = {
-        {addr16("192.0.2.10"), 3260}, {addr16("2001:db8::10"), 3260}, {addr16("127.0.0.1"), 3261}};
-    EXPECT_EQ(want, portals_of(node));
-    isns_iscsi_node_free(node);
+    ASSERT_EQ(0, _iqn_next("iqn.b", &rec));
+    EXPECT_EQ(3, rec->tpgt) << "successor of a record";
+    EXPECT_EQ(0, _iqn_next(std::string(255, 'q').c_str(), &rec));
+    EXPECT_EQ(nullptr, rec) << "the last record has a NULL successor";
+    EXPECT_EQ(-1, _iqn_next("iqn.c", &rec));
+
+    _iqn_del("iqn.a");
+    _iqn_del("iqn.absent");
+    _iqn_del(nullptr);
+    EXPECT_EQ((std::vector<std::string>{"iqn.b/2", "iqn.a/3", std::string(255, 'q') + "/7"}), listed());
+    EXPECT_EQ(0, _iqn_clear());
+    EXPECT_TRUE(listed().empty());
+    EXPECT_EQ(0, _iqn_clear());
 }
 
-TEST_F(InRoot, NodeWithoutPortalsIsBuiltAndUnlistablePortalsFail)
+TEST(AddressText, HostNameAndIpv4Conversions)
 {
-    std::vector<target_spec> targets = {{"t1", 1}, {"t2", 2}};
-    targets[0].portals.clear();
-    targets[1].in_kernel = false;
-    store_targets(kEid, targets);
+    char text[] = "NAS_Box1.Z-a_9";
+    EXPECT_EQ(0, conv_str(text));
+    EXPECT_STREQ("nas-box1.z-a-9", text);
+    EXPECT_EQ(-1, conv_str(nullptr));
 
+    unsigned char b[16], want[16];
+    ASSERT_EQ(0, ipv4_text_to_bytes(b, "192.0.2.10"));
+    ASSERT_EQ(1, inet_pton(AF_INET6, "::ffff:192.0.2.10", want));
+    EXPECT_EQ(0, std::memcmp(want, b, 16));
+    for (const char *bad : {"1.2.3", "1.2.3.4.5", "", "1234"})
+        EXPECT_EQ(-1, ipv4_text_to_bytes(b, bad)) << bad;
+    EXPECT_EQ(-1, ipv4_text_to_bytes(b, nullptr));
+    // Huge parts keep their low byte instead of overflowing.
+    ASSERT_EQ(0, ipv4_text_to_bytes(b, "99999999999999999999.0.0.1"));
+    EXPECT_EQ(1, b[15]);
+}
+
+TEST_F(InRoot, NodeGetsEveryKernelPortalOrFailsWhenTheyCannotBeListed)
+{
+    std::vector<target_spec> targets = {{"t1", 5}, {"t2", 2}, {"t3", 3}};
+    targets[0].portals.push_back("127.0.0.1:3261");
+    targets[1].portals.clear();
+    targets[2].in_kernel = false;
+    store_targets(kEid, targets);
+    const std::string t1 = target_iqn(kEid, "t1");
+
+    auto portals_of = [](isns_iscsi_node *node) {
+        std::set<std::pair<bytes, uint32_t>> out;
+        for (isns_ip_portal *p : korv::list_records<isns_ip_portal>(&node->portals))
+            out.insert({bytes(p->address, p->address + 16), p->port});
+        isns_iscsi_node_free(node);
+        return out;
+    };
     isns_iscsi_node *node = isns_iscsi_node_new();
-    EXPECT_EQ(0, get_iscsi_node_from_mod(node, target_iqn(kEid, "t1").c_str(), 1));
+    ASSERT_EQ(0, get_iscsi_node_from_mod(node, t1.c_str(), 5));
+    EXPECT_EQ(t1, node->name);
+    EXPECT_EQ(5u, node->pg_tag);
+    EXPECT_EQ((std::set<std::pair<bytes, uint32_t>>{
+                  {addr16("192.0.2.10"), 3260}, {addr16("2001:db8::10"), 3260}, {addr16("127.0.0.1"), 3261}}),
+              portals_of(node));
+
+    node = isns_iscsi_node_new();
+    EXPECT_EQ(0, get_iscsi_node_from_mod(node, target_iqn(kEid, "t2").c_str(), 2)) << "no portal is fine";
     EXPECT_TRUE(portals_of(node).empty());
+
+    node = isns_iscsi_node_new();
     std::string out = capture_stdout([&] {
-        EXPECT_EQ(-1, get_iscsi_node_from_mod(node, target_iqn(kEid, "t2").c_str(), 2));
+        EXPECT_EQ(-1, get_iscsi_node_from_mod(node, target_iqn(kEid, "t3").c_str(), 3));
     });
     EXPECT_NE(std::string::npos, out.find("can not get target ip")) << out;
-    EXPECT_EQ(-1, get_iscsi_node_from_mod(node, target_iqn(kEid, "t1").c_str(), -1));
+    EXPECT_EQ(-1, get_iscsi_node_from_mod(node, t1.c_str(), -1));
     EXPECT_EQ(-1, get_iscsi_node_from_mod(node, nullptr, 1));
     EXPECT_EQ(-1, get_iscsi_node_from_mod(nullptr, "iqn.x", 1));
     isns_iscsi_node_free(node);
 }
 
-TEST_F(InRoot, ListHoldsEveryStoredTargetUnderTheHostsIdentifier)
+TEST_F(InRoot, ListHoldsTheStoredTargetsUnderTheHostsIdentifier)
 {
-    store_targets(kEid, {{"t1", 1}, {"t2", 7}, {"t3", 3}});
+    store_targets(kEid, {{"t1", 1}, {"t2", 7}});
     ASSERT_EQ(0, iscsi_conf_init(&g_nesrad_conf));
-    EXPECT_EQ(3, init_iqn_list());
+    EXPECT_EQ(2, init_iqn_list());
     EXPECT_STREQ("nas-box1", isns_entity_id);
-    EXPECT_EQ((std::vector<std::string>{target_iqn(kEid, "t1") + "/1", target_iqn(kEid, "t2") + "/7",
-                                        target_iqn(kEid, "t3") + "/3"}),
-              listed());
+    EXPECT_EQ((std::vector<std::string>{target_iqn(kEid, "t1") + "/1", target_iqn(kEid, "t2") + "/7"}), listed());
+
+    // Without a readable host name the identifier is kept.
+    _iqn_clear();
+    SysRoot::remove("/proc/sys/kernel/hostname");
+    std::snprintf(isns_entity_id, sizeof isns_entity_id, "kept");
+    store_targets(kEid, {{"t1", 1}});
+    EXPECT_EQ(1, init_iqn_list());
+    EXPECT_EQ((std::vector<std::string>{target_iqn("kept", "t1") + "/1"}), listed());
 
     _iqn_clear();
     store_targets(kEid, {});
     EXPECT_EQ(0, init_iqn_list());
     EXPECT_TRUE(listed().empty());
-}
 
-TEST_F(InRoot, UnreadableHostNameKeepsTheIdentifierAndBadTargetsFail)
-{
-    store_targets(kEid, {{"t1", 1}});
-    ASSERT_EQ(0, iscsi_conf_init(&g_nesrad_conf));
-    SysRoot::remove("/proc/sys/kernel/hostname");
-    std::snprintf(isns_entity_id, sizeof isns_entity_id, "kept");
-    EXPECT_EQ(1, init_iqn_list());
-    EXPECT_EQ((std::vector<std::string>{target_iqn("kept", "t1") + "/1"}), listed());
-
-    _iqn_clear();
-    std::vector<target_spec> targets = {{"t1", 1}, {"t2", -1}};
-    store_targets(kEid, targets);
+    store_targets(kEid, {{"t1", 1}, {"t2", -1}});
     std::string out = capture_stdout([] { EXPECT_EQ(-1, init_iqn_list()); });
     EXPECT_NE(std::string::npos, out.find("get target conf from config failed")) << out;
 }
@@ -268,22 +216,23 @@ TEST_F(InRoot, RequestsCarryTheFirstNodeAsSourceAndDeregistrationClearsIt)
     EXPECT_EQ(0, target_register_iSNS_all());
     EXPECT_STREQ(t1.c_str(), isns_entity_name);
     EXPECT_EQ(0, target_deregister_entity_identifier());
-    EXPECT_EQ(std::string(), isns_entity_name);
+    EXPECT_STREQ("", isns_entity_name);
     EXPECT_EQ(0, target_deregister_entity_identifier());
 
     ASSERT_TRUE(eventually([&] { return srv.requests().size() == 4; }, std::chrono::seconds(5)));
     std::vector<bytes> reqs = srv.requests();
+    auto text = [](const std::string &s) { return bytes(s.begin(), s.end()) + bytes{0}; };
     // Registration of the entity: source and node are t1, with its portals.
-    EXPECT_EQ(isns_attr_str(32, t1), bytes(reqs[0].begin() + 12, reqs[0].begin() + 12 + isns_attr_str(32, t1).size()));
+    EXPECT_TRUE(sourced_by(reqs[0], t1));
     EXPECT_TRUE(has_attr(reqs[0], 16, addr16("192.0.2.10")));
     EXPECT_TRUE(has_attr(reqs[0], 16, addr16("2001:db8::10")));
-    EXPECT_TRUE(has_attr(reqs[0], 1, text_bytes(kEid)));
-    // The further node: source t1, node t2.
-    EXPECT_EQ(isns_attr_str(32, t1), bytes(reqs[1].begin() + 12, reqs[1].begin() + 12 + isns_attr_str(32, t1).size()));
-    EXPECT_TRUE(has_attr(reqs[1], 32, text_bytes(t2)));
+    EXPECT_TRUE(has_attr(reqs[0], 1, text(kEid)));
+    // The further node: source t1, node t2 with its tag.
+    EXPECT_TRUE(sourced_by(reqs[1], t1));
+    EXPECT_TRUE(has_attr(reqs[1], 32, text(t2)));
     EXPECT_TRUE(has_attr(reqs[1], 51, {0, 0, 0, 2}));
     // Deregistrations: by t1, then with the empty source.
     EXPECT_EQ(4, reqs[2][3]);
-    EXPECT_TRUE(has_attr(reqs[2], 32, text_bytes(t1)));
-    EXPECT_EQ(isns_attr_str(32, ""), bytes(reqs[3].begin() + 12, reqs[3].begin() + 24));
+    EXPECT_TRUE(has_attr(reqs[2], 32, text(t1)));
+    EXPECT_TRUE(sourced_by(reqs[3], ""));
 }

@@ -3,7 +3,6 @@
 // The VM has configfs and the target modules' dependencies preloaded and the
 // three target modules in /usr/local/modules/driver; nothing else. Each suite
 // leaves the driver stopped, so the order of the suites does not matter.
-#include <arpa/inet.h>
 #include <gtest/gtest.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
@@ -12,10 +11,9 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstring>
-#include <dirent.h>
 #include <fcntl.h>
+#include <filesystem>
 #include <fstream>
-#include <memory>
 #include <sstream>
 #include <string>
 #include <vector>
@@ -24,27 +22,23 @@
 #include "common/korvadm_sys.h"
 #include "kernel/korvadm_mod.h"
 #include "kernel/korvadm_mod_lio4.h"
+#include "tests/vm/vm_targets.h"
 
 namespace {
 
-const std::string kConfigfs = "/sys/kernel/config";
 const std::string kIscsi = "/sys/kernel/config/target/iscsi";
 const std::string kCore = "/sys/kernel/config/target/core";
 const char *const kModules[] = {"target_core_mod", "target_core_file", "iscsi_target_mod"};
 
 // ---- the kernel as seen by hand, independent of the driver ----
 
-bool exists(const std::string &path)
-{
-    struct stat st;
-    return ::lstat(path.c_str(), &st) == 0;
-}
-
 ino_t inode_of(const std::string &path)
 {
     struct stat st;
     return ::lstat(path.c_str(), &st) == 0 ? st.st_ino : 0;
 }
+
+bool exists(const std::string &path) { return inode_of(path) != 0; }
 
 // The attribute's text as the kernel gives it (line end included).
 std::string slurp(const std::string &path)
@@ -76,118 +70,54 @@ int make_dir(const std::string &path)
 std::vector<std::string> subdirs(const std::string &dir)
 {
     std::vector<std::string> names;
-    if (DIR *d = ::opendir(dir.c_str())) {
-        while (dirent *e = ::readdir(d)) {
-            std::string name = e->d_name;
-            struct stat st;
-            if (name != "." && name != ".." && ::lstat((dir + "/" + name).c_str(), &st) == 0 &&
-                S_ISDIR(st.st_mode))
-                names.push_back(name);
-        }
-        ::closedir(d);
-    }
+    std::error_code ec;
+    for (const auto &e : std::filesystem::directory_iterator(dir, ec))
+        if (!e.is_symlink(ec) && e.is_directory(ec))
+            names.push_back(e.path().filename());
     std::sort(names.begin(), names.end());
     return names;
 }
 
-bool module_loaded(const std::string &name)
-{
-    std::ifstream in("/proc/modules");
-    std::string line;
-    while (std::getline(in, line))
-        if (line.compare(0, name.size() + 1, name + " ") == 0)
-            return true;
-    return false;
-}
-
+// The target modules now loaded, in load order.
 std::vector<std::string> loaded_target_modules()
 {
+    std::ifstream in("/proc/modules");
+    std::string all, line;
+    while (std::getline(in, line))
+        all += " " + line.substr(0, line.find(' ')) + " ";
     std::vector<std::string> loaded;
     for (const char *m : kModules)
-        if (module_loaded(m))
+        if (all.find(" " + std::string(m) + " ") != std::string::npos)
             loaded.push_back(m);
     return loaded;
 }
 
 bool configfs_mounted()
 {
-    std::ifstream in("/proc/mounts");
-    std::string dev, dir, type;
-    std::string rest;
-    while (in >> dev >> dir >> type && std::getline(in, rest))
-        if (dir == kConfigfs && type == "configfs")
-            return true;
-    return false;
+    return ::system("grep -q ' /sys/kernel/config configfs ' /proc/mounts") == 0;
 }
 
-// A listening TCP socket on port, from /proc/net/tcp or tcp6.
+// A listening TCP socket (state 0A) on port, from /proc/net/tcp or tcp6.
 bool kernel_listens(int port, bool ipv6)
 {
-    std::ifstream in(ipv6 ? "/proc/net/tcp6" : "/proc/net/tcp");
-    std::string line;
-    char want[8];
-    std::snprintf(want, sizeof want, ":%04X", port);
-    std::getline(in, line);
-    while (std::getline(in, line)) {
-        std::istringstream f(line);
-        std::string slot, local, remote, state;
-        f >> slot >> local >> remote >> state;
-        if (state == "0A" && local.size() > 5 && local.compare(local.size() - 5, 5, want) == 0)
-            return true;
-    }
-    return false;
-}
-
-// The automatic fe80:: address of an interface, from /proc/net/if_inet6.
-std::string link_local_of(const std::string &ifname)
-{
-    std::ifstream in("/proc/net/if_inet6");
-    std::string hex, index, plen, scope, flags, name;
-    while (in >> hex >> index >> plen >> scope >> flags >> name) {
-        if (name != ifname || hex.compare(0, 4, "fe80") != 0 || hex.size() != 32)
-            continue;
-        unsigned char bytes[16];
-        for (int i = 0; i < 16; i++)
-            bytes[i] = static_cast<unsigned char>(std::stoi(hex.substr(2 * i, 2), nullptr, 16));
-        char text[INET6_ADDRSTRLEN];
-        if (inet_ntop(AF_INET6, bytes, text, sizeof text))
-            return text;
-    }
-    return "";
+    char cmd[160];
+    std::snprintf(cmd, sizeof cmd, "grep -qE '^ *[0-9]+: [0-9A-F]+:%04X [0-9A-F]+:[0-9A-F]+ 0A ' /proc/net/tcp%s",
+                  port, ipv6 ? "6" : "");
+    return ::system(cmd) == 0;
 }
 
 // ---- the driver's records ----
 
-struct TargetFree {
-    void operator()(iscsi_target_t *t) const { iscsi_target_free(t); }
-};
-using Target = std::unique_ptr<iscsi_target_t, TargetFree>;
+using vm::Target;
+using vm::want_portal;
 
-Target make_target(const std::string &iqn, int tpgt, const std::string &alias = "vm alias")
+Target make_target(const std::string &iqn, int tpgt)
 {
-    Target t(iscsi_target_new());
-    if (t) {
-        std::snprintf(t->iqn, sizeof t->iqn, "%s", iqn.c_str());
-        std::snprintf(t->alias, sizeof t->alias, "%s", alias.c_str());
-        t->tpgt = tpgt;
+    Target t = vm::make_target(iqn, tpgt);
+    if (t)
         t->dataout_timeout = 5;
-    }
     return t;
 }
-
-void want_portal(iscsi_target_t *t, const std::string &ipv4, const std::string &ipv6, int port,
-                 const std::string &dev = "")
-{
-    iscsi_ip_t *ip = iscsi_ip_new();
-    ASSERT_NE(ip, nullptr);
-    std::snprintf(ip->ipv4, sizeof ip->ipv4, "%s", ipv4.c_str());
-    std::snprintf(ip->ipv6, sizeof ip->ipv6, "%s", ipv6.c_str());
-    std::snprintf(ip->dev_name, sizeof ip->dev_name, "%s", dev.c_str());
-    ip->port = port;
-    list_append(&ip->node, &t->ip_list);
-}
-
-void clear_wanted(iscsi_target_t *t) { iscsi_ip_free_list(&t->ip_list); }
 
 std::string tpg_dir(const iscsi_target_t *t)
 {
@@ -210,13 +140,19 @@ std::vector<std::string> reported_portals(iscsi_target_t *t, int *rc)
 }
 
 // A fileio backstore made by hand (the backstore operations are not this
-// suite's subject), mapped as LUN 0 of the portal group.
-void hand_made_lun(const std::string &tpg, const std::string &name)
+// suite's subject), and one mapped as LUN 0 of the portal group.
+void hand_made_backstore(const std::string &hba, const std::string &name)
 {
-    const std::string dev = kCore + "/fileio_0/" + name;
+    const std::string dev = kCore + "/" + hba + "/" + name;
     ASSERT_EQ(::system(("mkdir -p '" + dev + "'").c_str()), 0);
     ASSERT_EQ(poke(dev + "/control", "fd_dev_name=/tmp/" + name + ".img,fd_dev_size=1048576"), 0);
     ASSERT_EQ(poke(dev + "/enable", "1"), 0);
+}
+
+void hand_made_lun(const std::string &tpg, const std::string &name)
+{
+    const std::string dev = kCore + "/fileio_0/" + name;
+    hand_made_backstore("fileio_0", name);
     ASSERT_EQ(make_dir(tpg + "/lun/lun_0"), 0);
     ASSERT_EQ(::symlink(dev.c_str(), (tpg + "/lun/lun_0/" + name).c_str()), 0);
 }
@@ -232,37 +168,6 @@ void hand_made_acl(const std::string &tpg, const std::string &initiator, bool ma
     }
 }
 
-// Removes the ACLs and LUNs of a portal group by hand, in the order the
-// kernel accepts: mapping links, mapped-LUN and ACL directories, then each
-// LUN's backstore link and directory. Returns whether nothing is left.
-bool unmake_acls_and_luns(const std::string &tpg)
-{
-    for (const std::string &acl : subdirs(tpg + "/acls")) {
-        const std::string a = tpg + "/acls/" + acl;
-        for (const std::string &mapped : subdirs(a)) {
-            if (mapped.rfind("lun_", 0) != 0)
-                continue;
-            ::unlink((a + "/" + mapped + "/" + mapped).c_str());
-            ::rmdir((a + "/" + mapped).c_str());
-        }
-        ::rmdir(a.c_str());
-    }
-    for (const std::string &lun : subdirs(tpg + "/lun")) {
-        const std::string l = tpg + "/lun/" + lun;
-        if (DIR *d = ::opendir(l.c_str())) {
-            std::vector<std::string> links;
-            while (dirent *e = ::readdir(d))
-                if (e->d_type == DT_LNK)
-                    links.push_back(l + "/" + e->d_name);
-            ::closedir(d);
-            for (const std::string &link : links)
-                ::unlink(link.c_str());
-        }
-        ::rmdir(l.c_str());
-    }
-    return subdirs(tpg + "/acls").empty() && subdirs(tpg + "/lun").empty();
-}
-
 // Leaves the machine with no target module loaded and nothing in configfs,
 // whatever a test left behind: the driver's stop, then by hand (a failure).
 void force_stopped()
@@ -270,12 +175,11 @@ void force_stopped()
     if (lio3_stop_module() == 0 && loaded_target_modules().empty())
         return;
     ADD_FAILURE() << "the driver's stop left modules behind; removing them by hand";
-    for (const std::string &iqn : subdirs(kIscsi))
-        for (const std::string &tpg : subdirs(kIscsi + "/" + iqn))
-            if (tpg.rfind("tpgt_", 0) == 0)
-                unmake_acls_and_luns(kIscsi + "/" + iqn + "/" + tpg);
-    ::system("cd /sys/kernel/config/target 2>/dev/null && {"
-             " rmdir iscsi/*/tpgt_*/np/* iscsi/*/tpgt_* iscsi/* core/fileio_*/* core/fileio_* iscsi; } 2>/dev/null;"
+    // Mapping links, mapped LUNs, ACLs, LUN links and LUNs, portals, groups,
+    // targets, backstores: the order the kernel accepts.
+    ::system("cd /sys/kernel/config/target 2>/dev/null && { T=iscsi/*/tpgt_*;"
+             " rm -f $T/acls/*/lun_*/*; rmdir $T/acls/*/lun_* $T/acls/*; rm -f $T/lun/*/*;"
+             " rmdir $T/lun/* $T/np/* $T iscsi/* core/fileio_*/* core/fileio_* iscsi; } 2>/dev/null;"
              " rmmod iscsi_target_mod; rmmod target_core_file; rmmod target_core_mod");
     if (!configfs_mounted())
         ::system("mount -t configfs configfs /sys/kernel/config");
@@ -289,32 +193,29 @@ protected:
     void TearDown() override { force_stopped(); }
 };
 
-TEST_F(LioModules, StartInsertsTheModulesAndMakesTheDirectories)
+TEST_F(LioModules, StartLoadsTheModulesAndStopUnloadsThem)
 {
     ASSERT_TRUE(loaded_target_modules().empty());
     EXPECT_EQ(iscsi_mod_get_state(), 1);
     EXPECT_FALSE(exists("/sys/kernel/config/target")); // comes with target_core_mod
 
     ASSERT_EQ(iscsi_mod_start(), 0);
-
     EXPECT_EQ(loaded_target_modules(), std::vector<std::string>(std::begin(kModules), std::end(kModules)));
     EXPECT_TRUE(exists(kIscsi + "/lio_version")) << "the fabric directory the kernel populates";
     EXPECT_TRUE(exists("/var/target/pr"));
     EXPECT_TRUE(exists("/var/target/alua"));
     EXPECT_EQ(iscsi_mod_get_state(), 0);
-}
 
-TEST_F(LioModules, StopLeavesNoModuleAndConfigfsMounted)
-{
-    ASSERT_EQ(iscsi_mod_start(), 0);
     ASSERT_EQ(iscsi_mod_stop(), 0);
     EXPECT_TRUE(loaded_target_modules().empty());
     EXPECT_EQ(iscsi_mod_get_state(), 1);
     EXPECT_TRUE(configfs_mounted());
-
-    // Stopping a stopped driver is a no-op, and it starts again afterwards.
+    // Stopping a stopped driver is a no-op, and it starts again afterwards,
+    // mounting configfs when nothing is mounted.
     EXPECT_EQ(iscsi_mod_stop(), 0);
+    ASSERT_EQ(::system("umount /sys/kernel/config"), 0);
     ASSERT_EQ(iscsi_mod_start(), 0);
+    EXPECT_TRUE(configfs_mounted());
     EXPECT_EQ(iscsi_mod_get_state(), 0);
 }
 
@@ -330,10 +231,7 @@ TEST_F(LioModules, StopTearsDownEverythingTheKernelHolds)
     ASSERT_EQ(lio3_enable_target(t.get()), 0);
     Target second = make_target("iqn.2026-01.vm:stop-second", 2);
     ASSERT_EQ(lio3_add_target(second.get()), 0);
-    const std::string spare = kCore + "/fileio_3/sparedisk"; // a backstore mapped nowhere
-    ASSERT_EQ(::system(("mkdir -p " + spare).c_str()), 0);
-    ASSERT_EQ(poke(spare + "/control", "fd_dev_name=/tmp/sparedisk.img,fd_dev_size=1048576"), 0);
-    ASSERT_EQ(poke(spare + "/enable", "1"), 0);
+    hand_made_backstore("fileio_3", "sparedisk"); // mapped nowhere
     // With configuration present the kernel refuses to unload the modules,
     // so the driver must have emptied configfs first, in an order it accepts.
     ASSERT_NE(::system("rmmod iscsi_target_mod 2>/dev/null"), 0);
@@ -346,36 +244,24 @@ TEST_F(LioModules, StopTearsDownEverythingTheKernelHolds)
     EXPECT_FALSE(kernel_listens(3260, false));
 }
 
-TEST_F(LioModules, StartMountsConfigfsWhenNothingIsMounted)
+TEST_F(LioModules, PartlyLoadedModulesAreRemovedAgain)
 {
-    ASSERT_EQ(::system("umount /sys/kernel/config"), 0);
-    ASSERT_FALSE(configfs_mounted());
-    ASSERT_EQ(iscsi_mod_start(), 0);
-    EXPECT_TRUE(configfs_mounted());
-    EXPECT_EQ(iscsi_mod_get_state(), 0);
-}
+    // A module missing: start fails and removes the two it inserted.
+    ASSERT_EQ(::rename("/usr/local/modules/driver/iscsi_target_mod.ko", "/tmp/iscsi_target_mod.ko"), 0);
+    int rc = iscsi_mod_start();
+    ASSERT_EQ(::rename("/tmp/iscsi_target_mod.ko", "/usr/local/modules/driver/iscsi_target_mod.ko"), 0);
+    EXPECT_EQ(rc, ERR_MODULE_START);
+    EXPECT_TRUE(loaded_target_modules().empty());
+    EXPECT_EQ(iscsi_mod_get_state(), 1);
 
-TEST_F(LioModules, HalfStartedDriverStopsByRemovingTheModules)
-{
     // Modules in, but no mkdir under the fabric yet: the kernel has not made
     // the iscsi directory, which the probe reports as half started.
     for (const char *m : kModules)
         ASSERT_EQ(::system(("insmod /usr/local/modules/driver/" + std::string(m) + ".ko").c_str()), 0);
     ASSERT_FALSE(exists(kIscsi));
     EXPECT_EQ(iscsi_mod_get_state(), ERR_MODULE_NO_CONFIGFS);
-
     EXPECT_EQ(iscsi_mod_stop(), 0);
     EXPECT_TRUE(loaded_target_modules().empty());
-}
-
-TEST_F(LioModules, StartFailsAndRollsBackWhenAModuleIsMissing)
-{
-    ASSERT_EQ(::rename("/usr/local/modules/driver/iscsi_target_mod.ko", "/tmp/iscsi_target_mod.ko"), 0);
-    int rc = iscsi_mod_start();
-    ASSERT_EQ(::rename("/tmp/iscsi_target_mod.ko", "/usr/local/modules/driver/iscsi_target_mod.ko"), 0);
-    EXPECT_EQ(rc, ERR_MODULE_START);
-    EXPECT_TRUE(loaded_target_modules().empty()) << "the two inserted modules are removed again";
-    EXPECT_EQ(iscsi_mod_get_state(), 1);
 }
 
 // ---- targets in a running driver ----
@@ -412,7 +298,7 @@ protected:
     std::string tpg_;
 };
 
-TEST_F(LioTarget, AddCreatesThePortalGroupWithItsDefaults)
+TEST_F(LioTarget, AddCreatesThePortalGroupWithItsDefaultsOnce)
 {
     ASSERT_EQ(lio3_add_target(t_.get()), 0);
 
@@ -426,14 +312,10 @@ TEST_F(LioTarget, AddCreatesThePortalGroupWithItsDefaults)
     // The data-out time-out goes to acls/default_policy, which this kernel
     // does not have: the write fails, is ignored, and no ACL appears.
     EXPECT_EQ(subdirs(tpg_ + "/acls"), std::vector<std::string>{});
-}
 
-TEST_F(LioTarget, AddingAnExistingTargetChangesNothing)
-{
-    ASSERT_EQ(lio3_add_target(t_.get()), 0);
+    // Adding it again changes nothing.
     ASSERT_EQ(poke(tpg_ + "/param/TargetAlias", "changed by hand"), 0);
     ASSERT_EQ(poke(tpg_ + "/attrib/generate_node_acls", "0"), 0);
-
     EXPECT_EQ(lio3_add_target(t_.get()), 0);
     EXPECT_EQ(attr("param/TargetAlias"), "changed by hand\n");
     EXPECT_EQ(attr("attrib/generate_node_acls"), "0\n");
@@ -489,7 +371,7 @@ TEST_F(LioTarget, AttributePrimitivesAgainstTheKernel)
 
 TEST_F(LioTarget, PortalsOfEveryKindAreCreatedListenedOnAndListed)
 {
-    const std::string ll = link_local_of("dummy0");
+    const std::string ll = vm::link_local_of("dummy0");
     ASSERT_FALSE(ll.empty()) << "dummy0 has no link-local address";
     ASSERT_EQ(lio3_add_target(t_.get()), 0);
     want_portal(t_.get(), "127.0.0.1", "", 3260);
@@ -516,28 +398,12 @@ TEST_F(LioTarget, PortalsOfEveryKindAreCreatedListenedOnAndListed)
     iscsi_ip_free_list(&got);
 }
 
-TEST_F(LioTarget, ReplacingPortalsDropsTheOldOnes)
+TEST_F(LioTarget, PortalsAreReplacedOrDiffedByAddress)
 {
     ASSERT_EQ(lio3_add_target(t_.get()), 0);
     want_portal(t_.get(), "127.0.0.1", "::1", 3260);
     ASSERT_EQ(lio3_set_target_ip(t_.get()), 0);
     ASSERT_EQ(subdirs(tpg_ + "/np"), (std::vector<std::string>{"127.0.0.1:3260", "[::1]:3260"}));
-
-    clear_wanted(t_.get());
-    want_portal(t_.get(), "127.0.0.2", "", 3270);
-    // A portal the kernel refuses (no such host) is skipped, the rest is made.
-    want_portal(t_.get(), "", "not-an-address", 3271);
-    EXPECT_EQ(lio3_set_target_ip(t_.get()), 0);
-    EXPECT_EQ(subdirs(tpg_ + "/np"), std::vector<std::string>{"127.0.0.2:3270"});
-    EXPECT_FALSE(kernel_listens(3260, false)) << "the kernel closed the removed portal";
-}
-
-TEST_F(LioTarget, PortalDiffAddsAndRemovesByAddress)
-{
-    ASSERT_EQ(lio3_add_target(t_.get()), 0);
-    want_portal(t_.get(), "127.0.0.1", "", 3260);
-    want_portal(t_.get(), "", "::1", 3260);
-    ASSERT_EQ(lio3_set_target_ip(t_.get()), 0);
     const ino_t kept = inode_of(tpg_ + "/np/127.0.0.1:3260");
 
     // The same list again changes nothing: same directories, same inodes.
@@ -545,22 +411,26 @@ TEST_F(LioTarget, PortalDiffAddsAndRemovesByAddress)
     EXPECT_EQ(subdirs(tpg_ + "/np"), (std::vector<std::string>{"127.0.0.1:3260", "[::1]:3260"}));
     EXPECT_EQ(inode_of(tpg_ + "/np/127.0.0.1:3260"), kept);
 
-    clear_wanted(t_.get());
+    vm::clear_portals(t_.get());
     want_portal(t_.get(), "127.0.0.1", "", 3299); // present by address: port not compared
     want_portal(t_.get(), "127.0.0.3", "", 3263);
     EXPECT_EQ(lio3_set_target_ip_v2(t_.get()), 0);
     EXPECT_EQ(subdirs(tpg_ + "/np"), (std::vector<std::string>{"127.0.0.1:3260", "127.0.0.3:3263"}));
     EXPECT_EQ(inode_of(tpg_ + "/np/127.0.0.1:3260"), kept);
     EXPECT_TRUE(kernel_listens(3263, false));
-}
 
-TEST_F(LioTarget, PortalsCanBeRemovedWhileTheTargetIsEnabled)
-{
-    ASSERT_EQ(lio3_add_target(t_.get()), 0);
-    want_portal(t_.get(), "127.0.0.1", "", 3260);
-    ASSERT_EQ(lio3_set_target_ip(t_.get()), 0);
+    // Replacing drops the old ones; a portal the kernel refuses (no such
+    // host) is skipped, the rest is made.
+    vm::clear_portals(t_.get());
+    want_portal(t_.get(), "127.0.0.2", "", 3270);
+    want_portal(t_.get(), "", "not-an-address", 3271);
+    EXPECT_EQ(lio3_set_target_ip(t_.get()), 0);
+    EXPECT_EQ(subdirs(tpg_ + "/np"), std::vector<std::string>{"127.0.0.2:3270"});
+    EXPECT_FALSE(kernel_listens(3260, false)) << "the kernel closed the removed portal";
+
+    // And they can all go while the target is enabled.
     ASSERT_EQ(lio3_enable_target(t_.get()), 0);
-    clear_wanted(t_.get());
+    vm::clear_portals(t_.get());
     EXPECT_EQ(lio3_set_target_ip_v2(t_.get()), 0);
     EXPECT_EQ(subdirs(tpg_ + "/np"), std::vector<std::string>{});
     EXPECT_EQ(attr("enable"), "1\n");
@@ -568,6 +438,12 @@ TEST_F(LioTarget, PortalsCanBeRemovedWhileTheTargetIsEnabled)
 
 TEST_F(LioTarget, EnableAndDisable)
 {
+    // Missing from the kernel: the enable switch cannot be read, which counts
+    // as enabled, and disabling fails.
+    EXPECT_EQ(lio3_enable_target(t_.get()), 0);
+    EXPECT_FALSE(exists(kIscsi + "/" + t_->iqn));
+    EXPECT_EQ(lio3_disable_target(t_.get()), ERR_CONFIGFS);
+
     ASSERT_EQ(lio3_add_target(t_.get()), 0);
     ASSERT_EQ(poke(tpg_ + "/param/AuthMethod", "None"), 0);
 
@@ -585,14 +461,6 @@ TEST_F(LioTarget, EnableAndDisable)
     EXPECT_EQ(attr("enable"), "0\n");
 }
 
-TEST_F(LioTarget, EnablingATargetMissingFromTheKernelFails)
-{
-    // The enable switch cannot be read, which counts as enabled.
-    EXPECT_EQ(lio3_enable_target(t_.get()), 0);
-    EXPECT_FALSE(exists(kIscsi + "/" + t_->iqn));
-    EXPECT_EQ(lio3_disable_target(t_.get()), ERR_CONFIGFS);
-}
-
 TEST_F(LioTarget, ChapSwitchAndCredentialsReachEveryAcl)
 {
     ASSERT_EQ(lio3_add_target(t_.get()), 0);
@@ -600,6 +468,14 @@ TEST_F(LioTarget, ChapSwitchAndCredentialsReachEveryAcl)
     hand_made_acl(tpg_, "iqn.2026-01.vm:init-b");
     t_->chap = 1;
     std::strcpy(t_->chap_user, "vmuser");
+    // An invalid setting changes nothing.
+    std::strcpy(t_->chap_pass, "short123456"); // 11 characters
+    const std::string before = attr("attrib/authentication");
+    const std::string user_before = attr("acls/iqn.2026-01.vm:init-a/auth/userid");
+    EXPECT_EQ(lio3_set_target_chap(t_.get()), ERR_PARAM);
+    EXPECT_EQ(attr("attrib/authentication"), before);
+    EXPECT_EQ(attr("acls/iqn.2026-01.vm:init-a/auth/userid"), user_before);
+
     std::strcpy(t_->chap_pass, "secret123456"); // 12 characters
     t_->mutual_chap = 1;
     std::strcpy(t_->mutual_user, "vmtarget");
@@ -674,22 +550,9 @@ TEST_F(LioTarget, ChapTheDriverSetsIsWhatTheKernelEnforcesAtLogin)
     EXPECT_EQ(::rmdir((kCore + "/fileio_0").c_str()), 0);
 }
 
-TEST_F(LioTarget, InvalidChapSettingsChangeNothing)
-{
-    ASSERT_EQ(lio3_add_target(t_.get()), 0);
-    hand_made_acl(tpg_, "iqn.2026-01.vm:init-c");
-    const std::string before = attr("attrib/authentication");
-    const std::string user_before = attr("acls/iqn.2026-01.vm:init-c/auth/userid");
-    t_->chap = 1;
-    std::strcpy(t_->chap_user, "vmuser");
-    std::strcpy(t_->chap_pass, "short123456"); // 11 characters
-    EXPECT_EQ(lio3_set_target_chap(t_.get()), ERR_PARAM);
-    EXPECT_EQ(attr("attrib/authentication"), before);
-    EXPECT_EQ(attr("acls/iqn.2026-01.vm:init-c/auth/userid"), user_before);
-}
-
 TEST_F(LioTarget, DataoutTimeoutGoesToEveryAclWithinTheKernelsRange)
 {
+    EXPECT_EQ(lio3_set_target_attr_dataout_timeout(7, t_.get()), ERR_TARGET_NOT_IN_KERNEL);
     ASSERT_EQ(lio3_add_target(t_.get()), 0);
     hand_made_acl(tpg_, "iqn.2026-01.vm:init-d");
     hand_made_acl(tpg_, "iqn.2026-01.vm:init-e");
@@ -707,19 +570,19 @@ TEST_F(LioTarget, DataoutTimeoutGoesToEveryAclWithinTheKernelsRange)
     EXPECT_EQ(attr("acls/iqn.2026-01.vm:init-e/attrib/dataout_timeout"), "7\n");
 }
 
-TEST_F(LioTarget, DataoutTimeoutOfATargetNotInTheKernel)
-{
-    EXPECT_EQ(lio3_set_target_attr_dataout_timeout(7, t_.get()), ERR_TARGET_NOT_IN_KERNEL);
-}
-
-TEST_F(LioTarget, DeleteTearsDownAnEnabledTargetWithItsPortals)
+TEST_F(LioTarget, DeleteTearsDownAnEnabledTargetInAnOrderTheKernelAccepts)
 {
     ASSERT_EQ(lio3_add_target(t_.get()), 0);
     want_portal(t_.get(), "127.0.0.1", "::1", 3260);
     ASSERT_EQ(lio3_set_target_ip(t_.get()), 0);
+    hand_made_lun(tpg_, "deldisk");
+    hand_made_acl(tpg_, "iqn.2026-01.vm:init-f", true);
+    hand_made_acl(tpg_, "iqn.2026-01.vm:init-g");
     ASSERT_EQ(lio3_enable_target(t_.get()), 0);
-    // The kernel refuses to drop the group while anything is in it.
+    // The kernel refuses to drop the group while anything is in it, and the
+    // backstore while the LUN links to it.
     ASSERT_EQ(::rmdir(tpg_.c_str()), -1);
+    ASSERT_EQ(::rmdir((kCore + "/fileio_0/deldisk").c_str()), -1);
 
     EXPECT_EQ(lio3_del_target(t_.get()), 0);
 
@@ -727,23 +590,6 @@ TEST_F(LioTarget, DeleteTearsDownAnEnabledTargetWithItsPortals)
     EXPECT_FALSE(kernel_listens(3260, false));
     EXPECT_TRUE(exists(std::string("/var/target/alua/iSCSI/") + t_->iqn + "+1")) << "left in place";
     EXPECT_EQ(lio3_del_target(t_.get()), 0) << "already removed";
-}
-
-TEST_F(LioTarget, DeleteRemovesAclsAndLunsInAnOrderTheKernelAccepts)
-{
-    ASSERT_EQ(lio3_add_target(t_.get()), 0);
-    want_portal(t_.get(), "127.0.0.1", "", 3260);
-    ASSERT_EQ(lio3_set_target_ip(t_.get()), 0);
-    hand_made_lun(tpg_, "deldisk");
-    hand_made_acl(tpg_, "iqn.2026-01.vm:init-f", true);
-    hand_made_acl(tpg_, "iqn.2026-01.vm:init-g");
-    ASSERT_EQ(lio3_enable_target(t_.get()), 0);
-    // The backstore is in use while the LUN links to it.
-    ASSERT_EQ(::rmdir((kCore + "/fileio_0/deldisk").c_str()), -1);
-
-    EXPECT_EQ(lio3_del_target(t_.get()), 0);
-
-    EXPECT_FALSE(exists(kIscsi + "/" + t_->iqn));
     // Backstores outlive their targets, unlinked: the kernel now lets them go.
     EXPECT_TRUE(exists(kCore + "/fileio_0/deldisk/control"));
     EXPECT_EQ(::rmdir((kCore + "/fileio_0/deldisk").c_str()), 0);
