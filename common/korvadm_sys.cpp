@@ -116,25 +116,18 @@ constexpr const char *kLan1Dev = "egiga0";
 constexpr const char *kLan2Dev = "egiga1";
 constexpr size_t kModeLen = 16;
 
-int _get_lan1_dev_name(char *dev_name)
+int copy_dev_name(const char *func, char *dev_name, const char *dev)
 {
     if (!dev_name) {
-        DBG(0, "dev_name is NULL");
+        korv_log(0, __FILE__, func, __LINE__, "dev_name is NULL");
         return ERR_PARAM;
     }
-    std::snprintf(dev_name, ISCSI_IP_DEV_LEN, "%s", kLan1Dev);
+    std::snprintf(dev_name, ISCSI_IP_DEV_LEN, "%s", dev);
     return KORV_OK;
 }
 
-int _get_lan2_dev_name(char *dev_name)
-{
-    if (!dev_name) {
-        DBG(0, "dev_name is NULL");
-        return ERR_PARAM;
-    }
-    std::snprintf(dev_name, ISCSI_IP_DEV_LEN, "%s", kLan2Dev);
-    return KORV_OK;
-}
+int _get_lan1_dev_name(char *dev_name) { return copy_dev_name(__func__, dev_name, kLan1Dev); }
+int _get_lan2_dev_name(char *dev_name) { return copy_dev_name(__func__, dev_name, kLan2Dev); }
 
 int read_ipv4(char *addr, const char *path, const char *fail)
 {

@@ -38,6 +38,13 @@ void free_record(T *rec)
     std::free(rec);
 }
 
+// Frees every record of a list through its type's own free.
+template <class T, void (*Free)(T *)>
+void free_records(list_t *list)
+{
+    list_release(list, [](void *rec) { Free(static_cast<T *>(rec)); });
+}
+
 int init_target_conf(target_conf_t *conf)
 {
     conf->dbidx = 0;
@@ -62,10 +69,7 @@ target_conf_t *target_conf_new(void)
 
 void target_conf_free(target_conf_t *conf) { free_record(conf); }
 
-void target_conf_free_list(list_t *list)
-{
-    list_release(list, [](void *rec) { target_conf_free(static_cast<target_conf_t *>(rec)); });
-}
+void target_conf_free_list(list_t *list) { free_records<target_conf_t, target_conf_free>(list); }
 
 lun_conf_t *lun_conf_new(void)
 {
@@ -91,10 +95,7 @@ void lun_conf_free(lun_conf_t *conf)
     free_record(conf);
 }
 
-void lun_conf_free_list(list_t *list)
-{
-    list_release(list, [](void *rec) { lun_conf_free(static_cast<lun_conf_t *>(rec)); });
-}
+void lun_conf_free_list(list_t *list) { free_records<lun_conf_t, lun_conf_free>(list); }
 
 target_map_lun_conf_t *target_map_lun_conf_new(void)
 {
@@ -106,10 +107,7 @@ target_map_lun_conf_t *target_map_lun_conf_new(void)
 
 void target_map_lun_conf_free(target_map_lun_conf_t *conf) { free_record(conf); }
 
-void target_map_lun_conf_free_list(list_t *list)
-{
-    list_release(list, [](void *rec) { target_map_lun_conf_free(static_cast<target_map_lun_conf_t *>(rec)); });
-}
+void target_map_lun_conf_free_list(list_t *list) { free_records<target_map_lun_conf_t, target_map_lun_conf_free>(list); }
 
 acl_initiator_conf_t *acl_initiator_conf_new(void)
 {
@@ -118,10 +116,7 @@ acl_initiator_conf_t *acl_initiator_conf_new(void)
 
 void acl_initiator_conf_free(acl_initiator_conf_t *conf) { free_record(conf); }
 
-void acl_initiator_conf_free_list(list_t *list)
-{
-    list_release(list, [](void *rec) { acl_initiator_conf_free(static_cast<acl_initiator_conf_t *>(rec)); });
-}
+void acl_initiator_conf_free_list(list_t *list) { free_records<acl_initiator_conf_t, acl_initiator_conf_free>(list); }
 
 lun_acl_conf_t *lun_acl_conf_new(void)
 {
@@ -133,10 +128,7 @@ lun_acl_conf_t *lun_acl_conf_new(void)
 
 void lun_acl_conf_free(lun_acl_conf_t *conf) { free_record(conf); }
 
-void lun_acl_conf_free_list(list_t *list)
-{
-    list_release(list, [](void *rec) { lun_acl_conf_free(static_cast<lun_acl_conf_t *>(rec)); });
-}
+void lun_acl_conf_free_list(list_t *list) { free_records<lun_acl_conf_t, lun_acl_conf_free>(list); }
 
 /* ---------------------------------------------------------------------------
  * Access rights, target names, the context

@@ -18,6 +18,14 @@
 
 // Shared helpers log under the operation that called them.
 #define LOG_AS(func, level, ...) korv_log((level), __FILE__, (func), __LINE__, __VA_ARGS__)
+// An operation's argument guard: logged under the operation, -9989.
+#define PARAM_ERROR_IF(refused)        \
+    do {                               \
+        if (refused) {                 \
+            DBG(0, "parameter error"); \
+            return ERR_PARAM;          \
+        }                              \
+    } while (0)
 
 namespace {
 
@@ -69,10 +77,7 @@ bool read_key(const char *root, int id, const char *key, char (&value)[kPathLen]
 
 int _search_xmldb_id_entry(int *out_id, const char *root, int max, const char *key, const char *value)
 {
-    if (!out_id || !root || !key || !value) {
-        DBG(0, "parameter error");
-        return ERR_PARAM;
-    }
+    PARAM_ERROR_IF(!out_id || !root || !key || !value);
     *out_id = 0;
     for (int n = 1; n <= max; n++) {
         char got[kPathLen];
@@ -88,10 +93,7 @@ int _search_xmldb_id_entry(int *out_id, const char *root, int max, const char *k
 
 int _get_free_xmldb_id_entry(int *out_id, const char *root, int max, const char *key)
 {
-    if (!out_id || !root || !key) {
-        DBG(0, "parameter error");
-        return ERR_PARAM;
-    }
+    PARAM_ERROR_IF(!out_id || !root || !key);
     *out_id = 0;
     if (max <= 0)
         return ID_ENTRY_NOT_FOUND;
@@ -266,10 +268,7 @@ int get_target_text(const char *func, int n, const char *field, char *buf, size_
 
 int _xmldb_get_target_dbidx_by_name(const char *name)
 {
-    if (!name) {
-        DBG(0, "parameter error");
-        return ERR_PARAM;
-    }
+    PARAM_ERROR_IF(!name);
     int n = 0;
     int rc = _search_xmldb_id_entry(&n, kTargetRoot, CONF_MAX_TARGETS, "name", name);
     if (rc == ID_ENTRY_FOUND)
@@ -289,10 +288,7 @@ int xmldb_check_target_exist(const char *name)
 
 int xmldb_check_add_target(const char *name)
 {
-    if (!name || !name[0]) {
-        DBG(0, "parameter error");
-        return ERR_PARAM;
-    }
+    PARAM_ERROR_IF(!name || !name[0]);
     for (int n = 1; n <= CONF_MAX_TARGETS; n++) {
         char path[kPathLen];
         char got[kPathLen] = "";
@@ -309,10 +305,7 @@ int xmldb_check_add_target(const char *name)
 
 int xmldb_add_new_target(target_conf_t *conf)
 {
-    if (!conf) {
-        DBG(0, "parameter error");
-        return ERR_PARAM;
-    }
+    PARAM_ERROR_IF(!conf);
     // Every check before the first write, so a refused record leaves no trace.
     const bool chap = conf->chap_enable == 1;
     const char *invalid = !conf->name[0]                             ? "target_suffix error"
@@ -394,10 +387,7 @@ int xmldb_add_new_target(target_conf_t *conf)
 
 int xmldb_del_target_by_name(const char *name)
 {
-    if (!name) {
-        DBG(0, "parameter error");
-        return ERR_PARAM;
-    }
+    PARAM_ERROR_IF(!name);
     int n = find_target(__func__, name);
     if (n < 1)
         return n;
@@ -421,10 +411,7 @@ int xmldb_set_target_hba_id(int hba_id, const char *name) { return set_target_in
 
 int xmldb_get_free_target_hba_id(int *hba_id)
 {
-    if (!hba_id) {
-        DBG(0, "parameter error");
-        return ERR_PARAM;
-    }
+    PARAM_ERROR_IF(!hba_id);
     bool used[CONF_MAX_TARGETS] = {};
     // One past the capacity, so a list that somehow holds more still stops.
     for (int n = 1; n <= CONF_MAX_TARGETS + 1; n++) {
@@ -451,10 +438,7 @@ int xmldb_get_free_target_hba_id(int *hba_id)
 
 int xmldb_get_target_iqn(char *buf, size_t size, const char *name)
 {
-    if (!buf || !name) {
-        DBG(0, "parameter error");
-        return ERR_PARAM;
-    }
+    PARAM_ERROR_IF(!buf || !name);
     if (size < CONF_IQN_LEN) {
         DBG(0, "parameter length error");
         return ERR_PARAM;
@@ -469,10 +453,7 @@ int xmldb_get_target_iqn(char *buf, size_t size, const char *name)
 
 int xmldb_set_target_iqn(const char *iqn, const char *name)
 {
-    if (!iqn || !name) {
-        DBG(0, "parameter error");
-        return ERR_PARAM;
-    }
+    PARAM_ERROR_IF(!iqn || !name);
     int n = _xmldb_get_target_dbidx_by_name(name);
     if (n < 1) {
         DBG(0, "can not find %s", name);
@@ -488,10 +469,8 @@ int xmldb_set_target_iqn(const char *iqn, const char *name)
 
 int xmldb_set_target_chap(int chap_enable, const char *chap_name, const char *chap_pwd, const char *name)
 {
-    if ((chap_enable != 0 && chap_enable != 1) || !name || (chap_enable == 1 && (!chap_name || !chap_pwd))) {
-        DBG(0, "parameter error");
-        return ERR_PARAM;
-    }
+    PARAM_ERROR_IF((chap_enable != 0 && chap_enable != 1) || !name ||
+                   (chap_enable == 1 && (!chap_name || !chap_pwd)));
     int n = _xmldb_get_target_dbidx_by_name(name);
     if (n < 1) {
         DBG(0, "get target db index failed, return code = %d", n);
@@ -567,10 +546,7 @@ int xmldb_update_current_targetcnt(void)
 
 int xmldb_get_target_status(char *buf, size_t size, const char *name)
 {
-    if (!buf || !name) {
-        DBG(0, "parameter error");
-        return ERR_PARAM;
-    }
+    PARAM_ERROR_IF(!buf || !name);
     if (size < CONF_NAME_LEN) {
         DBG(0, "parameter length error");
         return ERR_PARAM;
@@ -583,10 +559,7 @@ int xmldb_get_target_status(char *buf, size_t size, const char *name)
 
 int xmldb_set_target_status(const char *status, const char *name)
 {
-    if (!status || !name) {
-        DBG(0, "parameter error");
-        return ERR_PARAM;
-    }
+    PARAM_ERROR_IF(!status || !name);
     int n = find_target(__func__, name);
     if (n < 1)
         return n;
@@ -694,10 +667,7 @@ int read_all_targets(const char *func, list_t *out, bool full)
 
 int xmldb_get_target_conf_by_name(target_conf_t *conf, const char *name)
 {
-    if (!conf || !name) {
-        DBG(0, "parameter error");
-        return ERR_PARAM;
-    }
+    PARAM_ERROR_IF(!conf || !name);
     int n = find_target(__func__, name);
     if (n < 1)
         return n;
@@ -724,10 +694,7 @@ int xmldb_clean_target_conf(void)
 
 int xmldb_del_target_conn_info(const char *name)
 {
-    if (!name) {
-        DBG(0, "parameter error");
-        return ERR_PARAM;
-    }
+    PARAM_ERROR_IF(!name);
     int n = 0;
     if (_search_xmldb_id_entry(&n, kTargetRoot, CONF_MAX_TARGETS, "name", name) != ID_ENTRY_FOUND || n < 1)
         return ID_ENTRY_NOT_FOUND;
@@ -741,10 +708,7 @@ int xmldb_del_target_conn_info(const char *name)
 
 int xmldb_set_target_conn_info(const char *name, int conn, const char *ip, const char *iqn)
 {
-    if (!name || !ip || !iqn) {
-        DBG(0, "parameter error");
-        return ERR_PARAM;
-    }
+    PARAM_ERROR_IF(!name || !ip || !iqn);
     int n = 0;
     if (_search_xmldb_id_entry(&n, kTargetRoot, CONF_MAX_TARGETS, "name", name) != ID_ENTRY_FOUND || n < 1)
         return ID_ENTRY_NOT_FOUND;
@@ -865,20 +829,14 @@ int xmldb_set_service_progress(int progress)
 
 int xmldb_get_nesrad_pid(int *pid)
 {
-    if (!pid) {
-        DBG(0, "parameter error");
-        return ERR_PARAM;
-    }
+    PARAM_ERROR_IF(!pid);
     *pid = static_cast<int>(dbGetLL(kIsnsPid));
     return KORV_OK;
 }
 
 int xmldb_set_nesrad_pid(int pid)
 {
-    if (pid < 0) {
-        DBG(0, "parameter error");
-        return ERR_PARAM;
-    }
+    PARAM_ERROR_IF(pid < 0);
     dbSetLL(pid, kIsnsPid);
     DBG(2, "set nesrad pid = %d", pid);
     return KORV_OK;
@@ -886,10 +844,7 @@ int xmldb_set_nesrad_pid(int pid)
 
 int xmldb_get_nesrad_enable(int *enable)
 {
-    if (!enable) {
-        DBG(0, "parameter error");
-        return ERR_PARAM;
-    }
+    PARAM_ERROR_IF(!enable);
     *enable = dbGetLL(kIsnsEnable) != 0;
     return KORV_OK;
 }
@@ -902,10 +857,7 @@ int xmldb_set_nesrad_enable(int enable)
 
 int xmldb_get_nesrad_ip(char *buf, size_t size)
 {
-    if (!buf || size == 0) {
-        DBG(0, "parameter error");
-        return ERR_PARAM;
-    }
+    PARAM_ERROR_IF(!buf || size == 0);
     std::memset(buf, 0, size);
     dbGetStr(buf, platform_size(size), kIsnsIp);
     return KORV_OK;
@@ -913,10 +865,7 @@ int xmldb_get_nesrad_ip(char *buf, size_t size)
 
 int xmldb_set_nesrad_ip(const char *ip)
 {
-    if (!ip) {
-        DBG(0, "parameter error");
-        return ERR_PARAM;
-    }
+    PARAM_ERROR_IF(!ip);
     dbSetStr(ip, kIsnsIp);
     return KORV_OK;
 }
@@ -947,10 +896,7 @@ int xmldb_set_debug_level(int level)
 
 int xmldb_get_korvadm_ver(int *ver)
 {
-    if (!ver) {
-        DBG(0, "parameter error");
-        return ERR_PARAM;
-    }
+    PARAM_ERROR_IF(!ver);
     char value[kPathLen] = "";
     DBG(2, "get strNode: %s", kVersion);
     if (xmldb_get_cstring(value, sizeof value, kVersion) != KORV_OK)
@@ -975,10 +921,7 @@ int xmldb_set_korvadm_ver(int ver)
 
 int xmldb_get_saved_host_name(char *buf, size_t size)
 {
-    if (!buf || size < kSavedHostNameLen) {
-        DBG(0, "parameter error");
-        return ERR_PARAM;
-    }
+    PARAM_ERROR_IF(!buf || size < kSavedHostNameLen);
     std::memset(buf, 0, size);
     if (xmldb_get_cstring(buf, size, kHostName) != KORV_OK) {
         DBG(0, "get saved host name error");
@@ -989,19 +932,13 @@ int xmldb_get_saved_host_name(char *buf, size_t size)
 
 int xmldb_set_saved_host_name(const char *host_name)
 {
-    if (!host_name) {
-        DBG(0, "parameter error");
-        return ERR_PARAM;
-    }
+    PARAM_ERROR_IF(!host_name);
     return xmldb_set_cstring(host_name, kHostName) == KORV_OK ? KORV_OK : ERR_DB_WRITE;
 }
 
 int xmldb_get_iqn_prefix(char *buf, size_t size)
 {
-    if (!buf || size < CONF_GEN_IQN_LEN) {
-        DBG(0, "parameter error");
-        return ERR_PARAM;
-    }
+    PARAM_ERROR_IF(!buf || size < CONF_GEN_IQN_LEN);
     buf[0] = '\0';
     if (xmldb_get_cstring(buf, size, kIqnPrefix) != KORV_OK) {
         DBG(0, "get saved iqn error");
@@ -1012,10 +949,7 @@ int xmldb_get_iqn_prefix(char *buf, size_t size)
 
 int xmldb_set_iqn_prefix(const char *prefix)
 {
-    if (!prefix) {
-        DBG(0, "parameter error");
-        return ERR_PARAM;
-    }
+    PARAM_ERROR_IF(!prefix);
     return xmldb_set_cstring(prefix, kIqnPrefix) == KORV_OK ? KORV_OK : ERR_DB_WRITE;
 }
 
