@@ -101,6 +101,10 @@ TEST_F(ConfContext, InitTakesTheHostNameInIqnFormOrFails)
 
 TEST_F(ConfContext, StoredDebugLevelBecomesTheProcessLevelWhenReadable)
 {
+    // Unset: the reader gives its own code and 0, the process level stays.
+    int level = 7;
+    EXPECT_EQ(xmldb_get_debug_level(&level), ERR_INT_VALUE);
+    EXPECT_EQ(level, 0);
     iscsi_conf_ctx_t ctx = {};
     ctx.ops = &iscsi_conf_ops;
     g_korv_debug_level = 1;
@@ -114,7 +118,7 @@ TEST_F(ConfContext, StoredDebugLevelBecomesTheProcessLevelWhenReadable)
 
     ctx.ops = &iscsi_conf_ops;
     g_korv_debug_level = 0;
-    put("/iscsi/target/dbg", "2");
+    EXPECT_EQ(xmldb_set_debug_level(2), KORV_OK);
     EXPECT_EQ(quiet([&] { return dbg_get_conf_target_debug_lv(&ctx); }, &out), 2);
     EXPECT_EQ(g_korv_debug_level, 2);
     EXPECT_NE(out.find("(korvadm_debug:dbg_get_conf_target_debug_lv:"), std::string::npos) << out;

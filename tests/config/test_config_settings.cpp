@@ -85,15 +85,8 @@ TEST_F(Settings, AddressesMapInterfacesToTwoSlots)
     EXPECT_EQ(raw("/iscsi/target/IPv6_1"), "2001:db8::1");
 }
 
-TEST_F(Settings, DebugLevelAndTempReturnCode)
+TEST_F(Settings, TempReturnCodeReportsAFailedWrite)
 {
-    int level = 7;
-    EXPECT_EQ(xmldb_get_debug_level(&level), ERR_INT_VALUE);
-    EXPECT_EQ(level, 0);
-    EXPECT_EQ(xmldb_set_debug_level(3), KORV_OK);
-    EXPECT_EQ(xmldb_get_debug_level(&level), KORV_OK);
-    EXPECT_EQ(level, 3);
-
     EXPECT_EQ(xmldb_set_temp_return_code(-9980), KORV_OK);
     EXPECT_EQ(raw("/temp/iscsi/return_code"), "-9980");
     db().kill();
@@ -102,7 +95,7 @@ TEST_F(Settings, DebugLevelAndTempReturnCode)
     EXPECT_NE(out.find("xmldb_set_int32_t error, return: -9992"), std::string::npos) << out;
 }
 
-TEST_F(Settings, ServiceAndDaemonSwitches)
+TEST_F(Settings, ServiceAndDaemonSwitchesReadUnsetAsZero)
 {
     int v = -1;
     EXPECT_EQ(xmldb_get_nesrad_pid(&v), KORV_OK);  // unset reads 0

@@ -48,7 +48,7 @@ std::string read_targets(int (*reader)(list_t *))
 
 using IdEntryScan = StoreTest;
 
-TEST_F(IdEntryScan, AnEmptyKeyHidesEverythingAfterIt)
+TEST_F(IdEntryScan, MatchesWholeValuesUpToTheLimitAndAnEmptyKeyHidesTheRest)
 {
     put("/l/id:1/name", "a");
     put("/l/id:2/name", "");
@@ -61,18 +61,12 @@ TEST_F(IdEntryScan, AnEmptyKeyHidesEverythingAfterIt)
     EXPECT_EQ(_cal_xmldb_id_entry_count("/l", 10, "name"), 1);
     EXPECT_EQ(_get_free_xmldb_id_entry(&id, "/l", 10, "name"), ID_ENTRY_FOUND);
     EXPECT_EQ(id, 2);
-}
 
-TEST_F(IdEntryScan, MatchesWholeValuesWithinTheLimit)
-{
-    put("/l/id:1/name", "ab");
+    // Whole values only, and never past the limit.
     put("/l/id:2/name", "abc");
-    put("/l/id:3/name", "x");
-    int id = 0;
-    EXPECT_EQ(_search_xmldb_id_entry(&id, "/l", 10, "name", "abc"), ID_ENTRY_FOUND);
-    EXPECT_EQ(id, 2);
-    EXPECT_EQ(_search_xmldb_id_entry(&id, "/l", 10, "name", "a"), ID_ENTRY_NOT_FOUND);
-    EXPECT_EQ(_search_xmldb_id_entry(&id, "/l", 2, "name", "x"), ID_ENTRY_NOT_FOUND);
+    EXPECT_EQ(_search_xmldb_id_entry(&id, "/l", 10, "name", "ab"), ID_ENTRY_NOT_FOUND);
+    EXPECT_EQ(_search_xmldb_id_entry(&id, "/l", 2, "name", "c"), ID_ENTRY_NOT_FOUND);
+    EXPECT_EQ(_search_xmldb_id_entry(&id, "/l", 3, "name", "c"), ID_ENTRY_FOUND);
     EXPECT_EQ(_cal_xmldb_id_entry_count("/l", 2, "name"), 2);
     EXPECT_EQ(_get_free_xmldb_id_entry(&id, "/l", 3, "name"), ID_ENTRY_NOT_FOUND);
     EXPECT_EQ(quiet([&] { return _search_xmldb_id_entry(&id, nullptr, 10, "name", "a"); }), ERR_PARAM);
@@ -164,7 +158,7 @@ TEST_F(TargetAdd, SixtyFifthTargetIsRefusedAndWritesNothing)
 
 using TargetFields = StoreTest;
 
-TEST_F(TargetFields, ReadAndWriteByName)
+TEST_F(TargetFields, ReadAndWriteByNameIncludingChap)
 {
     put_target(1, "alpha", 2, 4);
     put_target(2, "beta", 5, 6);
@@ -186,11 +180,8 @@ TEST_F(TargetFields, ReadAndWriteByName)
     EXPECT_EQ(quiet([&] { return xmldb_get_target_status(buf, CONF_NAME_LEN - 1, "alpha"); }), ERR_PARAM);
     put(tpath(2, "tpgt"), "");
     EXPECT_EQ(quiet([&] { return xmldb_get_target_tpgt(&v, "beta"); }), ERR_INT_VALUE);
-}
 
-TEST_F(TargetFields, ChapSwitchWritesOrClearsCredentials)
-{
-    put_target(1, "alpha");
+    // The CHAP switch writes or clears the credentials; a bad switch writes nothing.
     EXPECT_EQ(xmldb_set_target_chap(1, "u", "pw", "alpha"), KORV_OK);
     EXPECT_EQ(raw(tpath(1, "chap_enable")) + raw(tpath(1, "chap_name")) + raw(tpath(1, "chap_pwd")), "1upw");
     EXPECT_EQ(xmldb_set_target_chap(0, "ignored", "ignored", "alpha"), KORV_OK);
@@ -218,7 +209,7 @@ TEST_F(TargetFields, FreeBackEndNumberIsTheLowestUnused)
 
 using TargetDelete = StoreTest;
 
-TEST_F(TargetDelete, LeavesAGapThatHidesLaterTargets)
+TEST_F(TargetDelete, LeavesAGapThatHidesLaterTargetsAndConnectionsGoAlone)
 {
     put_target(1, "a");
     put_target(2, "b");
@@ -232,11 +223,8 @@ TEST_F(TargetDelete, LeavesAGapThatHidesLaterTargets)
     EXPECT_EQ(xmldb_check_target_exist("a"), 1);
     EXPECT_EQ(read_targets(xmldb_get_all_target_conf_lite), "a/1/1");
     EXPECT_EQ(quiet([&] { return xmldb_del_target_by_name("b"); }), ERR_NOT_FOUND);
-}
 
-TEST_F(TargetDelete, ConnectionRecordsFollowTheirTarget)
-{
-    put_target(1, "a");
+    // Connection records go alone; the target stays.
     EXPECT_EQ(xmldb_set_target_conn_info("a", 2, "192.0.2.5", "iqn.1994-05.com.example:init"), KORV_OK);
     EXPECT_EQ(raw("/iscsi/target/id:1/conn_info/conn:2/ip"), "192.0.2.5");
     EXPECT_EQ(raw("/iscsi/target/id:1/conn_info/conn:2/iqn"), "iqn.1994-05.com.example:init");

@@ -28,11 +28,8 @@ TEST_F(TypedAccess, IntegerReadsFollowAtoiButRefuseEmptyOrAbsent)
         const char *path;
         int rc;
         int32_t value;
-    } cases[] = {{"/t/empty", ERR_INT_VALUE, 0},
-                 {"/t/absent", ERR_INT_VALUE, 0},
-                 {"/t/mixed", KORV_OK, 12},
-                 {"/t/word", KORV_OK, 0},
-                 {"/t/neg", KORV_OK, -42}};
+    } cases[] = {{"/t/empty", ERR_INT_VALUE, 0}, {"/t/absent", ERR_INT_VALUE, 0}, {"/t/mixed", KORV_OK, 12},
+                 {"/t/word", KORV_OK, 0}, {"/t/neg", KORV_OK, -42}};
     for (const auto &c : cases) {
         int32_t v = 77;
         EXPECT_EQ(xmldb_get_int32_t(&v, c.path), c.rc) << c.path;
@@ -90,7 +87,6 @@ TEST_F(TypedAccess, ADeadServiceIsAClientFailure)
     std::string out;
     EXPECT_EQ(quiet([&] { return xmldb_get_cstring(buf, sizeof buf, "/t/i"); }, &out), ERR_DB_CLIENT);
     EXPECT_NE(out.find("xmldbc_get path = /t/i failed"), std::string::npos) << out;
-    EXPECT_EQ(quiet([&] { return xmldb_set_int32_t(1, "/t/i"); }), ERR_DB_CLIENT);
     EXPECT_EQ(quiet([&] { return xmldb_set_cstring("x", "/t/i"); }), ERR_DB_CLIENT);
     EXPECT_EQ(quiet([&] { return xmldb_delete_node("/t/i"); }), ERR_DB_WRITE);
 }
