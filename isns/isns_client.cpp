@@ -138,29 +138,36 @@ void isns_iscsi_node_list_release(list_t *list)
     list_release(list, [](void *n) { isns_iscsi_node_free(static_cast<isns_iscsi_node *>(n)); });
 }
 
-int register_entity(isns_iscsi_node *node)
+namespace {
+
+// The entity's first registration also carries the protocol and its portals;
+// further nodes only name portals the entity already has.
+int register_with(isns_iscsi_node *node, bool entity)
 {
     if (!node)
         return -1;
     g_reg_options = 1;
     emit_reg_head();
-    emit_entity_protocol(ISNS_ENTITY_PROTOCOL_ISCSI);
-    if (g_reg_options & 1)
-        emit_portals(node, 0);
+    if (entity) {
+        emit_entity_protocol(ISNS_ENTITY_PROTOCOL_ISCSI);
+        if (g_reg_options & 1)
+            emit_portals(node, 0);
+    }
     emit_reg_node(node);
     const int r = send_and_recv();
     return r < 0 ? r : 0;
 }
 
+}  // namespace
+
+int register_entity(isns_iscsi_node *node)
+{
+    return register_with(node, true);
+}
+
 int register_node(isns_iscsi_node *node)
 {
-    if (!node)
-        return -1;
-    g_reg_options = 1;
-    emit_reg_head();
-    emit_reg_node(node);
-    const int r = send_and_recv();
-    return r < 0 ? r : 0;
+    return register_with(node, false);
 }
 
 int deregister_entity(const char *name)

@@ -73,18 +73,21 @@ bool decode_request(std::string_view payload, Request &req)
            req.value.find('\0') == std::string_view::npos;
 }
 
-bool send_all(int fd, const void *buf, size_t len, Clock::time_point deadline)
+namespace {
+
+// Moves len bytes through io (a non-blocking send or recv), waiting for
+// events between partial transfers; false on error, end of stream or deadline.
+template <class Io>
+bool transfer_all(int fd, size_t len, short events, Clock::time_point deadline, Io io)
 {
-    auto *p = static_cast<const char *>(buf);
-    while (len > 0) {
-        ssize_t n = send(fd, p, len, MSG_NOSIGNAL | MSG_DONTWAIT);
+    for (size_t done = 0; done < len;) {
+        ssize_t n = io(done, len - done);
         if (n > 0) {
-            p += n;
-            len -= static_cast<size_t>(n);
+            done += static_cast<size_t>(n);
         } else if (n < 0 && errno == EINTR) {
             continue;
         } else if (n < 0 && (errno == EAGAIN || errno == EWOULDBLOCK)) {
-            if (!wait_fd(fd, POLLOUT, deadline))
+            if (!wait_fd(fd, events, deadline))
                 return false;
         } else {
             return false;
@@ -93,24 +96,20 @@ bool send_all(int fd, const void *buf, size_t len, Clock::time_point deadline)
     return true;
 }
 
+}  // namespace
+
+bool send_all(int fd, const void *buf, size_t len, Clock::time_point deadline)
+{
+    auto *p = static_cast<const char *>(buf);
+    return transfer_all(fd, len, POLLOUT, deadline,
+                        [&](size_t at, size_t n) { return send(fd, p + at, n, MSG_NOSIGNAL | MSG_DONTWAIT); });
+}
+
 bool recv_all(int fd, void *buf, size_t len, Clock::time_point deadline)
 {
     auto *p = static_cast<char *>(buf);
-    while (len > 0) {
-        ssize_t n = recv(fd, p, len, MSG_DONTWAIT);
-        if (n > 0) {
-            p += n;
-            len -= static_cast<size_t>(n);
-        } else if (n < 0 && errno == EINTR) {
-            continue;
-        } else if (n < 0 && (errno == EAGAIN || errno == EWOULDBLOCK)) {
-            if (!wait_fd(fd, POLLIN, deadline))
-                return false;
-        } else {
-            return false;  // end of stream or error
-        }
-    }
-    return true;
+    return transfer_all(fd, len, POLLIN, deadline,
+                        [&](size_t at, size_t n) { return recv(fd, p + at, n, MSG_DONTWAIT); });
 }
 
 }  // namespace xmldb

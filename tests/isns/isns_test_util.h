@@ -9,12 +9,13 @@
 #include "isns/isns_client.h"
 #include "isns/isns_pdu.h"
 #include "isns/isns_transport.h"
+#include "tests/support/isns_isnsd.h"
 #include "tests/support/isns_test_server.h"
 
-// Byte vectors join with +.
-using korv_test::operator+;
-
 namespace isns_test {
+
+// The test server, its byte builders and + on byte vectors.
+using namespace korv_test;
 
 inline void reset_client(const char *server, int family = AF_INET)
 {
@@ -55,11 +56,20 @@ inline isns_iscsi_node *make_node(const char *name, uint32_t tag, std::initializ
     return n;
 }
 
-inline korv_test::bytes status_rsp(uint32_t status, uint16_t func = 0x8002)
+inline bytes status_rsp(uint32_t status, uint16_t func = 0x8002)
 {
-    korv_test::bytes payload = {static_cast<uint8_t>(status >> 24), static_cast<uint8_t>(status >> 16),
-                                static_cast<uint8_t>(status >> 8), static_cast<uint8_t>(status)};
-    return korv_test::isns_pdu(func, 0x4c00, payload);
+    return isns_pdu(func, 0x4c00, {static_cast<uint8_t>(status >> 24), static_cast<uint8_t>(status >> 16),
+                                   static_cast<uint8_t>(status >> 8), static_cast<uint8_t>(status)});
 }
+
+// A fresh isnsd named srv on address (skips when isnsd is not installed),
+// with the client pointed at it and `source` as the source name.
+#define START_ISNSD(srv, address, family, source)                                              \
+    if (!isns_test::isnsd_available())                                                         \
+        GTEST_SKIP() << "isnsd/isnsadm not installed (open-isns-server, open-isns-utils)";     \
+    isns_test::isnsd_server srv(address);                                                      \
+    ASSERT_TRUE(srv.start()) << srv.error();                                                   \
+    isns_test::reset_client(address, family);                                                  \
+    std::snprintf(isns_entity_name, sizeof isns_entity_name, "%s", source)
 
 }  // namespace isns_test

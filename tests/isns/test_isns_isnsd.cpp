@@ -2,9 +2,7 @@
 #include <gtest/gtest.h>
 
 #include "tests/isns/isns_test_util.h"
-#include "tests/support/isns_isnsd.h"
 
-using korv_test::isnsd_server;
 using namespace isns_test;
 
 namespace {
@@ -12,16 +10,9 @@ namespace {
 constexpr const char *kT1 = "iqn.2026-01.test:nas1.t1";
 constexpr const char *kT2 = "iqn.2026-01.test:nas1.t2";
 
-#define REQUIRE_ISNSD()                                                   \
-    do {                                                                  \
-        if (!korv_test::isnsd_available())                                \
-            GTEST_SKIP() << "isnsd/isnsadm not installed (open-isns-server, open-isns-utils)"; \
-    } while (0)
-
 // Registers the entity with kT1, then kT2, both on the same two portals.
 void register_two_targets()
 {
-    std::snprintf(isns_entity_name, sizeof isns_entity_name, "%s", kT1);
     isns_iscsi_node *t1 = make_node(kT1, 1, {"192.168.1.10", "2001:db8::10"});
     isns_iscsi_node *t2 = make_node(kT2, 1, {"192.168.1.10", "2001:db8::10"});
     EXPECT_EQ(register_entity(t1), 0) << "status " << isns_last_status;
@@ -34,21 +25,14 @@ void register_two_targets()
 
 TEST(IsnsOpenIsns, RegistrationLifecycle)
 {
-    REQUIRE_ISNSD();
-    isnsd_server srv("127.10.4.1");
-    ASSERT_TRUE(srv.start()) << srv.error();
-    reset_client("127.10.4.1");
+    START_ISNSD(srv, "127.10.4.1", AF_INET, kT1);
     register_two_targets();
 
-    const std::string entities = srv.adm("--list entities");
-    EXPECT_NE(entities.find("nas1"), std::string::npos) << entities;
-    const std::string nodes = srv.adm("--list nodes");
-    EXPECT_NE(nodes.find(kT1), std::string::npos) << nodes;
-    EXPECT_NE(nodes.find(kT2), std::string::npos) << nodes;
-    const std::string portals = srv.adm("--list portals");
-    EXPECT_NE(portals.find("192.168.1.10"), std::string::npos) << portals;
-    EXPECT_NE(portals.find("2001:db8::10"), std::string::npos) << portals;
-    EXPECT_NE(portals.find("3260"), std::string::npos) << portals;
+    for (auto [list, want] : {std::pair{"entities", "nas1"}, {"nodes", kT1}, {"nodes", kT2},
+                              {"portals", "192.168.1.10"}, {"portals", "2001:db8::10"}, {"portals", "3260"}}) {
+        const std::string held = srv.adm(std::string("--list ") + list);
+        EXPECT_NE(held.find(want), std::string::npos) << want << " not in:\n" << held;
+    }
     const std::string groups = srv.adm("--list portal-groups");
     for (const char *t : {kT1, kT2}) {
         size_t n = 0;
@@ -76,11 +60,7 @@ TEST(IsnsOpenIsns, RegistrationLifecycle)
 
 TEST(IsnsOpenIsns, FurtherNodeWithForeignPortalIsRefused)
 {
-    REQUIRE_ISNSD();
-    isnsd_server srv("127.10.4.2");
-    ASSERT_TRUE(srv.start()) << srv.error();
-    reset_client("127.10.4.2");
-    std::snprintf(isns_entity_name, sizeof isns_entity_name, "%s", kT1);
+    START_ISNSD(srv, "127.10.4.2", AF_INET, kT1);
     isns_iscsi_node *t1 = make_node(kT1, 1, {"192.168.1.10"});
     isns_iscsi_node *t2 = make_node(kT2, 2, {"192.168.1.20"});
     ASSERT_EQ(register_entity(t1), 0);
@@ -97,11 +77,7 @@ TEST(IsnsOpenIsns, PortallessNodeIsStoredWithoutType)
 {
     // The node type goes with the portal groups, so the server keeps the node
     // but the type-keyed check does not find it.
-    REQUIRE_ISNSD();
-    isnsd_server srv("127.10.4.3");
-    ASSERT_TRUE(srv.start()) << srv.error();
-    reset_client("127.10.4.3");
-    std::snprintf(isns_entity_name, sizeof isns_entity_name, "%s", kT1);
+    START_ISNSD(srv, "127.10.4.3", AF_INET, kT1);
     isns_iscsi_node *t1 = make_node(kT1, 1, {});
     ASSERT_EQ(register_entity(t1), 0);
     EXPECT_NE(srv.adm("--list nodes").find(kT1), std::string::npos);
