@@ -188,14 +188,20 @@ int make_dir_include_parent(const char *path, mode_t mode)
     return -1;
 }
 
-int remove_dir(const char *path)
+namespace {
+// Missing counts as removed: teardown often runs over half-removed state.
+int remove_entry(const char *path, int (*remove_fn)(const char *), const char *verb)
 {
     if (!path || !*path)
         return -1;
-    DBG(2, "rmdir %s ", path);
-    if (rmdir(path) == 0 || errno == ENOENT)
-        return 0;
-    return -1;
+    DBG(2, "%s %s ", verb, path);
+    return remove_fn(path) == 0 || errno == ENOENT ? 0 : -1;
+}
+}  // namespace
+
+int remove_dir(const char *path)
+{
+    return remove_entry(path, rmdir, "rmdir");
 }
 
 int remove_dir_recurive(const char *path)
@@ -216,12 +222,7 @@ int remove_dir_recurive(const char *path)
 
 int remove_file(const char *path)
 {
-    if (!path || !*path)
-        return -1;
-    DBG(2, "unlink %s ", path);
-    if (unlink(path) == 0 || errno == ENOENT)
-        return 0;
-    return -1;
+    return remove_entry(path, unlink, "unlink");
 }
 
 int create_file_if_absent(const char *path, mode_t mode)

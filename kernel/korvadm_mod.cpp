@@ -67,11 +67,13 @@ int iscsi_mod_select(int type)
 
 namespace {
 
-// The common tail of every wrapper once its arguments are checked: the
-// table, then the slot. `no_table` is what the wrapper answers without one.
+// The body of every wrapper: its argument check, the table, then the slot.
+// `no_table` is what the wrapper answers without a table.
 template <class Slot, class... Args>
-int call_slot(Slot iscsi_mod_ops_t::*slot, int no_table, Args... args)
+int call_slot(bool args_ok, Slot iscsi_mod_ops_t::*slot, int no_table, Args... args)
 {
+    if (!args_ok)
+        return ERR_PARAM;
     const iscsi_mod_ops_t *ops = iscsi_mod_ops;
     if (!ops)
         return no_table;
@@ -85,151 +87,120 @@ int call_slot(Slot iscsi_mod_ops_t::*slot, int no_table, Args... args)
 
 int iscsi_mod_start(void)
 {
-    return call_slot(&iscsi_mod_ops_t::start_module, ERR_MODULE_START);
+    return call_slot(true, &iscsi_mod_ops_t::start_module, ERR_MODULE_START);
 }
 
 int iscsi_mod_stop(void)
 {
-    return call_slot(&iscsi_mod_ops_t::stop_module, ERR_MODULE_START);
+    return call_slot(true, &iscsi_mod_ops_t::stop_module, ERR_MODULE_START);
 }
 
 int iscsi_mod_get_state(void)
 {
-    return call_slot(&iscsi_mod_ops_t::get_module_state, 1);
+    return call_slot(true, &iscsi_mod_ops_t::get_module_state, 1);
 }
 
 int iscsi_mod_add_target(iscsi_target_t *target)
 {
-    if (!target)
-        return ERR_PARAM;
-    return call_slot(&iscsi_mod_ops_t::add_target, ERR_PARAM, target);
+    return call_slot(target, &iscsi_mod_ops_t::add_target, ERR_PARAM, target);
 }
 
 int iscsi_mod_del_target(iscsi_target_t *target)
 {
-    if (!target)
-        return ERR_PARAM;
-    return call_slot(&iscsi_mod_ops_t::del_target, ERR_PARAM, target);
+    return call_slot(target, &iscsi_mod_ops_t::del_target, ERR_PARAM, target);
 }
 
 int iscsi_mod_enable_target(iscsi_target_t *target)
 {
-    if (!target)
-        return ERR_PARAM;
-    return call_slot(&iscsi_mod_ops_t::enable_target, ERR_PARAM, target);
+    return call_slot(target, &iscsi_mod_ops_t::enable_target, ERR_PARAM, target);
 }
 
 int iscsi_mod_disable_target(iscsi_target_t *target)
 {
-    if (!target)
-        return ERR_PARAM;
-    return call_slot(&iscsi_mod_ops_t::disable_target, ERR_PARAM, target);
+    return call_slot(target, &iscsi_mod_ops_t::disable_target, ERR_PARAM, target);
 }
 
 int iscsi_mod_set_target_chap(iscsi_target_t *target)
 {
-    if (!target)
-        return ERR_PARAM;
-    return call_slot(&iscsi_mod_ops_t::set_target_chap, ERR_PARAM, target);
+    return call_slot(target, &iscsi_mod_ops_t::set_target_chap, ERR_PARAM, target);
 }
 
 int iscsi_mod_set_target_ip(iscsi_target_t *target)
 {
-    if (!target)
-        return ERR_PARAM;
-    return call_slot(&iscsi_mod_ops_t::set_target_ip, ERR_PARAM, target);
+    return call_slot(target, &iscsi_mod_ops_t::set_target_ip, ERR_PARAM, target);
 }
 
 int iscsi_mod_set_dataout_timeout(int timeout, iscsi_target_t *target)
 {
-    if (timeout < 0 || !target)
-        return ERR_PARAM;
-    return call_slot(&iscsi_mod_ops_t::set_target_attr_dataout_timeout, ERR_PARAM, timeout, target);
+    return call_slot(timeout >= 0 && target, &iscsi_mod_ops_t::set_target_attr_dataout_timeout,
+                     ERR_PARAM, timeout, target);
 }
 
 int iscsi_mod_get_target_ip_list(list_t *ip_list, iscsi_target_t *target)
 {
-    if (!ip_list || !target)
-        return ERR_PARAM;
-    return call_slot(&iscsi_mod_ops_t::get_target_existing_ip_list, ERR_PARAM, ip_list, target);
+    return call_slot(ip_list && target, &iscsi_mod_ops_t::get_target_existing_ip_list, ERR_PARAM, ip_list, target);
 }
 
 int iscsi_mod_add_backstore(iscsi_lun_t *lun)
 {
-    if (!lun)
-        return ERR_PARAM;
-    return call_slot(&iscsi_mod_ops_t::add_backstore, ERR_PARAM, lun);
+    return call_slot(lun, &iscsi_mod_ops_t::add_backstore, ERR_PARAM, lun);
 }
 
 int iscsi_mod_del_backstore(iscsi_lun_t *lun)
 {
-    if (!lun)
-        return ERR_PARAM;
     // No table is a start failure here, not a parameter error.
-    return call_slot(&iscsi_mod_ops_t::del_backstore, ERR_MODULE_START, lun);
+    return call_slot(lun, &iscsi_mod_ops_t::del_backstore, ERR_MODULE_START, lun);
 }
 
 int iscsi_mod_shutdown_backstore(iscsi_lun_t *lun)
 {
-    if (!lun)
-        return ERR_PARAM;
-    return call_slot(&iscsi_mod_ops_t::shutdown_backstore, ERR_PARAM, lun);
+    return call_slot(lun, &iscsi_mod_ops_t::shutdown_backstore, ERR_PARAM, lun);
 }
 
 int iscsi_mod_change_backstore_size(iscsi_lun_t *lun)
 {
-    if (!lun)
-        return ERR_PARAM;
-    return call_slot(&iscsi_mod_ops_t::change_backstore_size, ERR_PARAM, lun);
+    return call_slot(lun, &iscsi_mod_ops_t::change_backstore_size, ERR_PARAM, lun);
 }
 
 int iscsi_mod_add_lun_mapping(iscsi_lun_t *lun, iscsi_target_t *target, int lun_number)
 {
-    if (!lun || !target || lun_number < 0)
-        return ERR_PARAM;
-    return call_slot(&iscsi_mod_ops_t::add_lun_mapping, ERR_PARAM, lun, target, lun_number);
+    return call_slot(lun && target && lun_number >= 0, &iscsi_mod_ops_t::add_lun_mapping,
+                     ERR_PARAM, lun, target, lun_number);
 }
 
 int iscsi_mod_del_lun_mapping(iscsi_lun_t *lun, iscsi_target_t *target)
 {
-    if (!lun || !target)
-        return ERR_PARAM;
-    return call_slot(&iscsi_mod_ops_t::del_lun_mapping, ERR_PARAM, lun, target);
+    return call_slot(lun && target, &iscsi_mod_ops_t::del_lun_mapping, ERR_PARAM, lun, target);
 }
 
 int iscsi_mod_add_acl_initiator(const char *initiator_name, iscsi_target_t *target)
 {
-    if (!initiator_name || !target)
-        return ERR_PARAM;
-    return call_slot(&iscsi_mod_ops_t::add_acl_initiator, ERR_PARAM, initiator_name, target);
+    return call_slot(initiator_name && target, &iscsi_mod_ops_t::add_acl_initiator,
+                     ERR_PARAM, initiator_name, target);
 }
 
 int iscsi_mod_del_acl_initiator(const char *initiator_name, iscsi_target_t *target)
 {
-    if (!initiator_name || !target)
-        return ERR_PARAM;
-    return call_slot(&iscsi_mod_ops_t::del_acl_initiator, ERR_PARAM, initiator_name, target);
+    return call_slot(initiator_name && target, &iscsi_mod_ops_t::del_acl_initiator,
+                     ERR_PARAM, initiator_name, target);
 }
 
 int iscsi_mod_add_lun_acl(iscsi_lun_acl_t *lun_acl)
 {
-    if (!lun_acl || !lun_acl->map_lun || !lun_acl->initiator)
-        return ERR_PARAM;
-    return call_slot(&iscsi_mod_ops_t::add_lun_acl, ERR_PARAM, lun_acl);
+    return call_slot(lun_acl && lun_acl->map_lun && lun_acl->initiator, &iscsi_mod_ops_t::add_lun_acl,
+                     ERR_PARAM, lun_acl);
 }
 
 int iscsi_mod_del_lun_acl(iscsi_lun_acl_t *lun_acl)
 {
-    if (!lun_acl || !lun_acl->map_lun || !lun_acl->initiator)
-        return ERR_PARAM;
-    return call_slot(&iscsi_mod_ops_t::del_lun_acl, ERR_PARAM, lun_acl);
+    return call_slot(lun_acl && lun_acl->map_lun && lun_acl->initiator, &iscsi_mod_ops_t::del_lun_acl,
+                     ERR_PARAM, lun_acl);
 }
 
 int iscsi_mod_get_target_session(list_t *sess_list, list_t *initiator_list, iscsi_target_t *target)
 {
-    if (!sess_list || !initiator_list || !target)
-        return ERR_PARAM;
-    return call_slot(&iscsi_mod_ops_t::get_target_session, ERR_PARAM, sess_list, initiator_list, target);
+    return call_slot(sess_list && initiator_list && target, &iscsi_mod_ops_t::get_target_session,
+                     ERR_PARAM, sess_list, initiator_list, target);
 }
 
 int iscsi_mod_get_target_ip_list_in_target_parm(list_t *ip_list, const char *target_iqn, int tpgt)

@@ -455,52 +455,45 @@ int lio3_stop_module(void)
 
 namespace {
 
-int _lio3_set_enable_default_policy(const char *iqn, int tpgt, int enable)
+// Writes value to the portal group's attribute `rel` and verifies it; the
+// log shows the value as `shown`.
+int write_tpg_attr(const char *iqn, int tpgt, const char *rel, const std::string &value, const char *shown)
 {
     if (!iqn || !tpgt_ok(tpgt))
         return ERR_PARAM;
-    std::string path = tpg_dir(iqn, tpgt) + "/attrib/generate_node_acls";
-    if (configfs_write_attr_int(path.c_str(), enable ? 1 : 0, 1) != 0) {
-        DBG(0, "set %s = %s failed", path.c_str(), enable ? "Enable" : "Disable");
+    std::string path = tpg_dir(iqn, tpgt) + rel;
+    if (configfs_write_attr_str(path.c_str(), value.c_str(), 1) != 0) {
+        DBG(0, "set %s = %s failed", path.c_str(), shown);
         return ERR_CONFIGFS;
     }
     return KORV_OK;
+}
+
+int write_tpg_attr(const char *iqn, int tpgt, const char *rel, int value)
+{
+    std::string text = std::to_string(value);
+    return write_tpg_attr(iqn, tpgt, rel, text, text.c_str());
+}
+
+int _lio3_set_enable_default_policy(const char *iqn, int tpgt, int enable)
+{
+    return write_tpg_attr(iqn, tpgt, "/attrib/generate_node_acls", enable ? "1" : "0",
+                          enable ? "Enable" : "Disable");
 }
 
 int _lio3_set_mcs_max_connection(const char *iqn, int tpgt, int max_conn)
 {
-    if (!iqn || !tpgt_ok(tpgt))
-        return ERR_PARAM;
-    std::string path = tpg_dir(iqn, tpgt) + "/param/MaxConnections";
-    if (configfs_write_attr_int(path.c_str(), max_conn, 1) != 0) {
-        DBG(0, "set %s = %d failed", path.c_str(), max_conn);
-        return ERR_CONFIGFS;
-    }
-    return KORV_OK;
+    return write_tpg_attr(iqn, tpgt, "/param/MaxConnections", max_conn);
 }
 
 int _lio3_set_target_alias(const char *iqn, int tpgt, const char *alias)
 {
-    if (!iqn || !alias || !tpgt_ok(tpgt))
-        return ERR_PARAM;
-    std::string path = tpg_dir(iqn, tpgt) + "/param/TargetAlias";
-    if (configfs_write_attr_str(path.c_str(), alias, 1) != 0) {
-        DBG(0, "set %s = %s failed", path.c_str(), alias);
-        return ERR_CONFIGFS;
-    }
-    return KORV_OK;
+    return alias ? write_tpg_attr(iqn, tpgt, "/param/TargetAlias", alias, alias) : ERR_PARAM;
 }
 
 int _lio3_set_target_default_cmdsn_depth(const char *iqn, int tpgt, int depth)
 {
-    if (!iqn || !tpgt_ok(tpgt) || depth < 0)
-        return ERR_PARAM;
-    std::string path = tpg_dir(iqn, tpgt) + "/attrib/default_cmdsn_depth";
-    if (configfs_write_attr_int(path.c_str(), depth, 1) != 0) {
-        DBG(0, "set %s = %d failed", path.c_str(), depth);
-        return ERR_CONFIGFS;
-    }
-    return KORV_OK;
+    return depth >= 0 ? write_tpg_attr(iqn, tpgt, "/attrib/default_cmdsn_depth", depth) : ERR_PARAM;
 }
 
 // Every step is tried even after a failure, so one refused attribute does
@@ -592,24 +585,64 @@ std::string np_name(const char *address, const char *interface, int port, int ty
     return "[" + std::string(address) + "]:" + std::to_string(port);
 }
 
+// The np directory of a portal; false when the arguments cannot name one.
+bool np_path(const char *iqn, int tpgt, const char *interface, const char *address, int port, int type,
+             std::string &path)
+{
+    if (!iqn || !address || !*address || std::strchr(address, '/') || !tpgt_ok(tpgt))
+        return false;
+    path = tpg_dir(iqn, tpgt) + "/np/" + np_name(address, interface, port, type);
+    return true;
+}
+
 int _lio3_create_network_portal(const char *iqn, int tpgt, const char *interface, const char *address,
                                 int port, int type)
 {
-    if (!iqn || !address || !*address || std::strchr(address, '/') || !tpgt_ok(tpgt))
+    std::string path;
+    if (!np_path(iqn, tpgt, interface, address, port, type, path))
         return ERR_PARAM;
-    std::string path = tpg_dir(iqn, tpgt) + "/np/" + np_name(address, interface, port, type);
-    if (make_dir(path.c_str(), 0700) != 0)
-        return ERR_CONFIGFS;
-    return KORV_OK;
+    return make_dir(path.c_str(), 0700) == 0 ? KORV_OK : ERR_CONFIGFS;
 }
 
 int _lio3_remove_network_portal(const char *iqn, int tpgt, const char *interface, const char *address,
                                 int port, int type)
 {
-    if (!iqn || !address || !*address || std::strchr(address, '/') || !tpgt_ok(tpgt))
+    std::string path;
+    if (!np_path(iqn, tpgt, interface, address, port, type, path))
         return ERR_PARAM;
-    std::string path = tpg_dir(iqn, tpgt) + "/np/" + np_name(address, interface, port, type);
     return configfs_rmdir(path.c_str()) == 0 ? KORV_OK : ERR_CONFIGFS;
+}
+
+const char *ip_address(const iscsi_ip_t *ip, int type)
+{
+    return type == IP_TYPE_V4 ? ip->ipv4 : ip->ipv6;
+}
+
+const char *ip_type_name(int type)
+{
+    return type == IP_TYPE_V4 ? "IP_TYPE_V4" : "IP_TYPE_V6";
+}
+
+bool list_has_address(list_t *list, const iscsi_ip_t *ip, int type)
+{
+    return type == IP_TYPE_V4 ? iscsi_ip_search_list_by_IPv4(list, ip->ipv4) != nullptr
+                              : iscsi_ip_search_list_by_IPv6(list, ip->ipv6) != nullptr;
+}
+
+// Creates the wanted portals of target, every IPv4 one first, leaving out
+// addresses `existing` already holds when it is given. Failures are logged.
+void create_portals(iscsi_target_t *target, list_t *existing)
+{
+    for (int type : {IP_TYPE_V4, IP_TYPE_V6}) {
+        for (iscsi_ip_t *ip : korv::list_records<iscsi_ip_t>(&target->ip_list)) {
+            const char *address = ip_address(ip, type);
+            if (!address[0] || (existing && list_has_address(existing, ip, type)))
+                continue;
+            if (_lio3_create_network_portal(target->iqn, target->tpgt, ip->dev_name, address, ip->port, type) != 0)
+                DBG(0, "_lio3_create_network_portal( %s , %d , %s , %s , %d, %s ) return error", target->iqn,
+                    target->tpgt, ip->dev_name, address, ip->port, ip_type_name(type));
+        }
+    }
 }
 
 // The kernel's portals of target, appended to list in directory order only
@@ -692,38 +725,35 @@ int _lio3_set_target_auth_ability(const char *iqn, int tpgt, int chap_flag)
     return KORV_OK;
 }
 
-int _lio3_set_target_acl_chap(const char *iqn, int tpgt, const char *initiator, const char *user,
-                              const char *password)
+// Writes one name/password pair to an ACL's auth group: `suffix` picks the
+// attributes ("" or "_mutual"), `kind` names the pair in the log.
+int write_acl_credentials(const char *iqn, int tpgt, const char *initiator, const char *suffix, const char *kind,
+                          const char *user, const char *password)
 {
     std::string auth = tpg_dir(iqn, tpgt) + "/acls/" + initiator + "/auth";
-    std::string userid = auth + "/userid";
+    std::string userid = auth + "/userid" + suffix;
     if (configfs_write_attr_str(userid.c_str(), user, 1) != 0) {
-        DBG(0, "write chap user to %s = %s failed", userid.c_str(), user);
+        DBG(0, "write %s user to %s = %s failed", kind, userid.c_str(), user);
         return ERR_CONFIGFS;
     }
-    std::string pass = auth + "/password";
+    std::string pass = auth + "/password" + suffix;
     if (configfs_write_attr_str(pass.c_str(), password, 1) != 0) {
-        DBG(0, "write chap password to %s = %s failed", pass.c_str(), password);
+        DBG(0, "write %s password to %s = %s failed", kind, pass.c_str(), password);
         return ERR_CONFIGFS;
     }
     return KORV_OK;
 }
 
+int _lio3_set_target_acl_chap(const char *iqn, int tpgt, const char *initiator, const char *user,
+                              const char *password)
+{
+    return write_acl_credentials(iqn, tpgt, initiator, "", "chap", user, password);
+}
+
 int _lio3_set_target_acl_mutual_chap(const char *iqn, int tpgt, const char *initiator, const char *user,
                                      const char *password)
 {
-    std::string auth = tpg_dir(iqn, tpgt) + "/acls/" + initiator + "/auth";
-    std::string userid = auth + "/userid_mutual";
-    if (configfs_write_attr_str(userid.c_str(), user, 1) != 0) {
-        DBG(0, "write mutual chap user to %s = %s failed", userid.c_str(), user);
-        return ERR_CONFIGFS;
-    }
-    std::string pass = auth + "/password_mutual";
-    if (configfs_write_attr_str(pass.c_str(), password, 1) != 0) {
-        DBG(0, "write mutual chap password to %s = %s failed", pass.c_str(), password);
-        return ERR_CONFIGFS;
-    }
-    return KORV_OK;
+    return write_acl_credentials(iqn, tpgt, initiator, "_mutual", "mutual chap", user, password);
 }
 
 // Writes the credentials the settings switch on to one ACL; mutual CHAP
@@ -970,18 +1000,7 @@ int lio3_set_target_ip(iscsi_target_t *target)
     CHECK_TARGET(target, "target is NULL", "target IQN is empty", "target TPGT out of limitation");
     if (_lio3_remove_all_np(target) != 0)
         DBG(0, "_lio3_remove_all_np error");
-    for (iscsi_ip_t *ip : korv::list_records<iscsi_ip_t>(&target->ip_list)) {
-        if (ip->ipv4[0] && _lio3_create_network_portal(target->iqn, target->tpgt, ip->dev_name, ip->ipv4,
-                                                       ip->port, IP_TYPE_V4) != 0)
-            DBG(0, "_lio3_create_network_portal( %s , %d , %s , %s , %d, IP_TYPE_V4 ) return error", target->iqn,
-                target->tpgt, ip->dev_name, ip->ipv4, ip->port);
-    }
-    for (iscsi_ip_t *ip : korv::list_records<iscsi_ip_t>(&target->ip_list)) {
-        if (ip->ipv6[0] && _lio3_create_network_portal(target->iqn, target->tpgt, ip->dev_name, ip->ipv6,
-                                                       ip->port, IP_TYPE_V6) != 0)
-            DBG(0, "_lio3_create_network_portal( %s , %d , %s , %s , %d, IP_TYPE_V6 ) return error", target->iqn,
-                target->tpgt, ip->dev_name, ip->ipv6, ip->port);
-    }
+    create_portals(target, nullptr);
     return KORV_OK;
 }
 
@@ -991,32 +1010,16 @@ int lio3_set_target_ip_v2(iscsi_target_t *target)
     ip_list_guard existing;
     if (_get_exist_ip_list(target, &existing.list) != 0)
         DBG(0, "_get_exist_ip_list error");
-
-    for (iscsi_ip_t *ip : korv::list_records<iscsi_ip_t>(&target->ip_list)) {
-        if (ip->ipv4[0] && !iscsi_ip_search_list_by_IPv4(&existing.list, ip->ipv4) &&
-            _lio3_create_network_portal(target->iqn, target->tpgt, ip->dev_name, ip->ipv4, ip->port,
-                                        IP_TYPE_V4) != 0)
-            DBG(0, "_lio3_create_network_portal( %s , %d , %s , %s , %d, IP_TYPE_V4 ) return error", target->iqn,
-                target->tpgt, ip->dev_name, ip->ipv4, ip->port);
-    }
-    for (iscsi_ip_t *ip : korv::list_records<iscsi_ip_t>(&target->ip_list)) {
-        if (ip->ipv6[0] && !iscsi_ip_search_list_by_IPv6(&existing.list, ip->ipv6) &&
-            _lio3_create_network_portal(target->iqn, target->tpgt, ip->dev_name, ip->ipv6, ip->port,
-                                        IP_TYPE_V6) != 0)
-            DBG(0, "_lio3_create_network_portal( %s , %d , %s , %s , %d, IP_TYPE_V6 ) return error", target->iqn,
-                target->tpgt, ip->dev_name, ip->ipv6, ip->port);
-    }
+    create_portals(target, &existing.list);
     for (iscsi_ip_t *ip : korv::list_records<iscsi_ip_t>(&existing.list)) {
-        if (ip->ipv4[0] && !iscsi_ip_search_list_by_IPv4(&target->ip_list, ip->ipv4) &&
-            _lio3_remove_network_portal(target->iqn, target->tpgt, ip->dev_name, ip->ipv4, ip->port,
-                                        IP_TYPE_V4) != 0)
-            DBG(0, "_lio3_remove_network_portal( %s , %d , %s , %s , %d , IP_TYPE_V4) return error", target->iqn,
-                target->tpgt, ip->dev_name, ip->ipv4, ip->port);
-        if (ip->ipv6[0] && !iscsi_ip_search_list_by_IPv6(&target->ip_list, ip->ipv6) &&
-            _lio3_remove_network_portal(target->iqn, target->tpgt, ip->dev_name, ip->ipv6, ip->port,
-                                        IP_TYPE_V6) != 0)
-            DBG(0, "_lio3_remove_network_portal( %s , %d , %s , %s , %d , IP_TYPE_V6) return error", target->iqn,
-                target->tpgt, ip->dev_name, ip->ipv6, ip->port);
+        for (int type : {IP_TYPE_V4, IP_TYPE_V6}) {
+            const char *address = ip_address(ip, type);
+            if (!address[0] || list_has_address(&target->ip_list, ip, type))
+                continue;
+            if (_lio3_remove_network_portal(target->iqn, target->tpgt, ip->dev_name, address, ip->port, type) != 0)
+                DBG(0, "_lio3_remove_network_portal( %s , %d , %s , %s , %d , %s) return error", target->iqn,
+                    target->tpgt, ip->dev_name, address, ip->port, ip_type_name(type));
+        }
     }
     return KORV_OK;
 }
@@ -1035,6 +1038,30 @@ int lio3_get_target_existing_ip_list(list_t *ip_list, iscsi_target_t *target)
     return KORV_OK;
 }
 
+namespace {
+// A name is given and the password is 12 to 16 characters; `kind` and the
+// two messages name the pair in the log.
+bool chap_pair_ok(const char (&user)[ISCSI_NAME_LEN], const char (&pass)[ISCSI_NAME_LEN], const char *kind,
+                  const char *no_name, const char *no_pass)
+{
+    size_t len = strnlen(pass, sizeof pass);
+    if (user[0] == '\0') {
+        DBG(0, "%s", no_name);
+        return false;
+    }
+    if (len == 0) {
+        DBG(0, "%s", no_pass);
+        return false;
+    }
+    if (len < CHAP_PASS_MIN || len > CHAP_PASS_MAX) {
+        DBG(0, "%s enabled, but %s password length = %u is not between 12 to 16", kind, kind,
+            static_cast<unsigned>(len));
+        return false;
+    }
+    return true;
+}
+}  // namespace
+
 int _lio3_validate_target_chap_settings(const iscsi_target_t *target)
 {
     if (!target) {
@@ -1043,37 +1070,16 @@ int _lio3_validate_target_chap_settings(const iscsi_target_t *target)
     }
     if (target->chap != 1)
         return 1;
-    size_t pass_len = strnlen(target->chap_pass, sizeof target->chap_pass);
-    if (target->chap_user[0] == '\0') {
-        DBG(0, "CHAP Enabled, but CHAP name is not given");
+    if (!chap_pair_ok(target->chap_user, target->chap_pass, "CHAP", "CHAP Enabled, but CHAP name is not given",
+                      "CHAP enabled, but CHAP password is not given"))
         return 0;
-    }
-    if (pass_len == 0) {
-        DBG(0, "CHAP enabled, but CHAP password is not given");
-        return 0;
-    }
-    if (pass_len < CHAP_PASS_MIN || pass_len > CHAP_PASS_MAX) {
-        DBG(0, "CHAP enabled, but CHAP password length = %u is not between 12 to 16",
-            static_cast<unsigned>(pass_len));
-        return 0;
-    }
     if (target->mutual_chap != 1)
         return 1;
-    size_t mpass_len = strnlen(target->mutual_pass, sizeof target->mutual_pass);
-    if (target->mutual_user[0] == '\0') {
-        DBG(0, "Mutual CHAP enabled, but Mutual CHAP name is not given");
-        return 0;
-    }
-    if (mpass_len == 0) {
-        DBG(0, "Mutual CHAP Enabled, but Mutual CHAP Password is not given");
-        return 0;
-    }
-    if (mpass_len < CHAP_PASS_MIN || mpass_len > CHAP_PASS_MAX) {
-        DBG(0, "Mutual CHAP enabled, but Mutual CHAP password length = %u is not between 12 to 16",
-            static_cast<unsigned>(mpass_len));
-        return 0;
-    }
-    return 1;
+    return chap_pair_ok(target->mutual_user, target->mutual_pass, "Mutual CHAP",
+                        "Mutual CHAP enabled, but Mutual CHAP name is not given",
+                        "Mutual CHAP Enabled, but Mutual CHAP Password is not given")
+               ? 1
+               : 0;
 }
 
 int _lio3_set_target_chap_to_acl(const char *initiator_iqn, iscsi_target_t *target)
