@@ -2,6 +2,7 @@
 // shell and System V semaphores.
 #include "common/korvadm_utils.h"
 
+#include <arpa/inet.h>
 #include <signal.h>
 #include <sys/ipc.h>
 #include <sys/sem.h>
@@ -9,8 +10,8 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <chrono>
+#include <cstring>
 #include <string>
 
 #include <gtest/gtest.h>
@@ -40,8 +41,7 @@ TEST_F(UtilsTest, MakeDirIncludeParentCreatesEveryLevelAndIsRepeatable)
     for (const char *p : {"/a", "/a/b", "/a/b/c"}) {
         struct stat st;
         ASSERT_EQ(stat(at(p).c_str(), &st), 0) << p;
-        EXPECT_TRUE(S_ISDIR(st.st_mode));
-        EXPECT_EQ(st.st_mode & 07777, 0700u) << p;
+        EXPECT_EQ(st.st_mode & (S_IFMT | 07777), S_IFDIR | 0700u) << p;
     }
     EXPECT_EQ(make_dir_include_parent(path.c_str(), 0), 0);
     // A file in the way is a failure, not an existing directory.
@@ -83,7 +83,6 @@ TEST_F(UtilsTest, AllocatedSizeOfASparseFileIsBelowItsLength)
     write_file(path, std::string(8192, 'x'));
     ASSERT_EQ(get_file_alloc_size(&size, path.c_str()), 0);
     EXPECT_GE(size, 8192ull);
-    EXPECT_EQ(size % 512, 0u);
 
     EXPECT_EQ(get_file_alloc_size(&size, at("/missing").c_str()), -1);
     EXPECT_EQ(size, 0u);
@@ -104,31 +103,21 @@ TEST_F(UtilsTest, SymlinkOverAnExistingLink)
     EXPECT_EQ(create_symlink("/t", at("/no/such/dir/link").c_str()), -1);
 }
 
-TEST_F(UtilsTest, FileCreationAndWritabilityProbe)
+TEST_F(UtilsTest, FileCreationPathChecksAndWritabilityProbe)
 {
     std::string path = at("/new");
-    EXPECT_EQ(create_file_if_absent(path.c_str(), 0700), 0);
-    EXPECT_TRUE(exists(path));
+    EXPECT_EQ(create_file_if_absent(path.c_str(), 0400), 0);
+    EXPECT_EQ(check_path_exist(path.c_str()), 0);
     write_file(path, "keep");
     EXPECT_EQ(create_file_if_absent(path.c_str(), 0700), 0);
     EXPECT_EQ(read_file(path), "keep");
+    EXPECT_EQ(check_path_access(path.c_str(), X_OK), -1);
+    EXPECT_EQ(check_path_exist(at("/none").c_str()), -1);
 
     mkdirs(at("/vol"));
     EXPECT_EQ(check_dir_is_writable(at("/vol").c_str(), ".iscsi_vol_test.temp", (1 << 20) + 17), 0);
     EXPECT_FALSE(exists(at("/vol/.iscsi_vol_test.temp")));
     EXPECT_EQ(check_dir_is_writable(at("/nodir").c_str(), ".iscsi_vol_test.temp", 1), -1);
-    EXPECT_EQ(check_dir_is_writable(at("/vol").c_str(), nullptr, 1), -1);
-}
-
-TEST_F(UtilsTest, PathChecks)
-{
-    write_file(at("/ro"), "x");
-    chmod(at("/ro").c_str(), 0400);
-    EXPECT_EQ(check_path_exist(at("/ro").c_str()), 0);
-    EXPECT_EQ(check_path_exist(at("/none").c_str()), -1);
-    EXPECT_EQ(check_path_exist(""), -1);
-    EXPECT_EQ(check_path_access(at("/ro").c_str(), R_OK), 0);
-    EXPECT_EQ(check_path_access(at("/ro").c_str(), X_OK), -1);
 }
 
 TEST_F(UtilsTest, RunSystemCmdEscapesItsArgumentAndRefusesOddFormats)
@@ -162,11 +151,8 @@ TEST_F(UtilsTest, RetriedCommandRunsUntilSuccessOrTriesRunOut)
     EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(10));
     EXPECT_EQ(read_file(count), "x\n");
 
-    std::string ok = "echo y >> " + count;
     write_file(count, "");
-    EXPECT_EQ(process_system_cmd_mt(ok.c_str(), 3, 1000), 0);
-    EXPECT_EQ(read_file(count), "y\n");
-    EXPECT_EQ(process_system_cmd_mt(ok.c_str(), 0, 1000), 0);
+    EXPECT_EQ(process_system_cmd_mt(("echo y >> " + count).c_str(), 3, 1000), 0);
     EXPECT_EQ(read_file(count), "y\n");
 }
 
@@ -174,20 +160,14 @@ TEST_F(UtilsTest, SemaphoreIsRecreatedAfterTheLastHolderLeaves)
 {
     key_t key = static_cast<key_t>(0x4b000000 | (getpid() & 0xffffff));
     int id = -1;
-    ASSERT_EQ(sem_P(&id, key), 0);
-    ASSERT_GE(id, 0);
-    EXPECT_EQ(semctl(id, 0, GETVAL), 0);  // held
-
-    EXPECT_EQ(sem_V(&id, key), 0);  // nobody waits: removed
-    EXPECT_EQ(id, -1);
-    EXPECT_EQ(semget(key, 1, 0666), -1);
-
-    ASSERT_EQ(sem_P(&id, key), 0);  // recreated at 1, taken at once
-    ASSERT_GE(id, 0);
-    EXPECT_EQ(semctl(id, 0, GETVAL), 0);
-    EXPECT_EQ(sem_V(&id, key), 0);
-    if (id >= 0)
-        semctl(id, 0, IPC_RMID);
+    for (int round = 0; round < 2; ++round) {  // the second one recreates it at 1
+        ASSERT_EQ(sem_P(&id, key), 0);
+        ASSERT_GE(id, 0);
+        EXPECT_EQ(semctl(id, 0, GETVAL), 0);  // held
+        EXPECT_EQ(sem_V(&id, key), 0);        // nobody waits: removed
+        EXPECT_EQ(id, -1);
+        EXPECT_EQ(semget(key, 1, 0666), -1);
+    }
 }
 
 TEST_F(UtilsTest, StopPreallocSignalsOnlyALivePidFromItsFile)
@@ -200,10 +180,8 @@ TEST_F(UtilsTest, StopPreallocSignalsOnlyALivePidFromItsFile)
     }
     write_file(at("/var/run/prealloc_lun1.pid"), std::to_string(child) + "\n");
     write_file(at("/var/run/prealloc_bad.pid"), "0\n");
-    stop_prealloc("bad");
-    stop_prealloc("missing");
-    stop_prealloc("");
-    stop_prealloc("../lun1");
+    for (const char *name : {"bad", "missing", "", "../lun1"})
+        stop_prealloc(name);
     stop_prealloc(nullptr);
     int status = 0;
     EXPECT_EQ(waitpid(child, &status, WNOHANG), 0);  // none of those reached it
@@ -219,57 +197,31 @@ TEST_F(UtilsTest, NameCharacters)
     EXPECT_EQ(check_name_chars_valid("iqn.2026-01.test:disk-1"), 0);
     EXPECT_EQ(check_name_chars_valid(std::string(223, 'a').c_str()), 0);
     EXPECT_EQ(check_name_chars_valid(std::string(224, 'a').c_str()), -1);
-    EXPECT_EQ(check_name_chars_valid(""), -1);
     EXPECT_EQ(check_name_chars_valid(nullptr), -1);
-    for (const char *bad : {"Upper", "a_b", "a b", "a/b", "a%b"})
+    for (const char *bad : {"", "Upper", "a_b", "a b", "a/b", "a%b"})
         EXPECT_EQ(check_name_chars_valid(bad), -1) << bad;
 }
 
-std::string hex(const unsigned char b[16])
+TEST_F(UtilsTest, Ipv6TextToBytesAgreesWithTheCLibrary)
 {
-    static const char digits[] = "0123456789abcdef";
-    std::string s;
-    for (int i = 0; i < 16; ++i) {
-        s += digits[b[i] >> 4];
-        s += digits[b[i] & 15];
-    }
-    return s;
-}
-
-TEST_F(UtilsTest, Ipv6TextToBytes)
-{
-    unsigned char b[16];
-    struct {
-        const char *text;
-        const char *bytes;
-    } cases[] = {
-        {"fe80::1", "fe800000000000000000000000000001"},
-        {"::1", "00000000000000000000000000000001"},
-        {"2001:db8::8:800:200c:417a", "20010db8000000000008080020 0c417a"},
-        {"1:2:3:4:5:6:7:8", "00010002000300040005000600070008"},
-        {"fd00::", "fd000000000000000000000000000000"},
-    };
-    for (auto &c : cases) {
-        std::string want(c.bytes);
-        want.erase(std::remove(want.begin(), want.end(), ' '), want.end());
-        ASSERT_EQ(ipv6_text_to_bytes(b, c.text), 0) << c.text;
-        EXPECT_EQ(hex(b), want) << c.text;
+    unsigned char got[16], want[16];
+    for (const char *text : {"fe80::1", "::1", "2001:db8::8:800:200c:417a", "1:2:3:4:5:6:7:8", "fd00::"}) {
+        ASSERT_EQ(inet_pton(AF_INET6, text, want), 1) << text;
+        ASSERT_EQ(ipv6_text_to_bytes(got, text), 0) << text;
+        EXPECT_EQ(std::memcmp(got, want, 16), 0) << text;
     }
     // Groups that would land outside the 16 bytes.
-    EXPECT_EQ(ipv6_text_to_bytes(b, "1:2:3:4:5:6:7:8:9"), -1);
-    EXPECT_EQ(ipv6_text_to_bytes(b, "::1:2:3:4:5:6:7:8:9"), -1);
-    EXPECT_EQ(ipv6_text_to_bytes(b, "::"), -1);
-    EXPECT_EQ(ipv6_text_to_bytes(b, nullptr), -1);
+    EXPECT_EQ(ipv6_text_to_bytes(got, "1:2:3:4:5:6:7:8:9"), -1);
+    EXPECT_EQ(ipv6_text_to_bytes(got, "::1:2:3:4:5:6:7:8:9"), -1);
+    EXPECT_EQ(ipv6_text_to_bytes(got, "::"), -1);
 }
 
 TEST_F(UtilsTest, Ipv6LinkLocal)
 {
-    EXPECT_EQ(is_ipv6_link_local("fe80::1"), 1);
-    EXPECT_EQ(is_ipv6_link_local("febf::1"), 1);
-    EXPECT_EQ(is_ipv6_link_local("fe80:1::1"), 0);
-    EXPECT_EQ(is_ipv6_link_local("fec0::1"), 0);
-    EXPECT_EQ(is_ipv6_link_local("::1"), 0);
-    EXPECT_EQ(is_ipv6_link_local("2001:db8::1"), 0);
+    for (const char *ll : {"fe80::1", "febf::1"})
+        EXPECT_EQ(is_ipv6_link_local(ll), 1) << ll;
+    for (const char *other : {"fe80:1::1", "fec0::1", "::1", "2001:db8::1"})
+        EXPECT_EQ(is_ipv6_link_local(other), 0) << other;
     EXPECT_EQ(is_ipv6_link_local("1:2:3:4:5:6:7:8:9"), -1);
 }
 
