@@ -1,5 +1,4 @@
 // The service's tree on its own: paths, dumps and the XML file form.
-#include "platform/xmldb_file.h"
 #include "platform/xmldb_tree.h"
 
 #include <gtest/gtest.h>
