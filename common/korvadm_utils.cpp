@@ -29,10 +29,7 @@ struct free_deleter {
 };
 using c_buffer = std::unique_ptr<char, free_deleter>;
 
-struct file_closer {
-    void operator()(std::FILE *f) const { std::fclose(f); }
-};
-using file_ptr = std::unique_ptr<std::FILE, file_closer>;
+using korv::file_ptr;
 
 struct pipe_closer {
     void operator()(std::FILE *f) const { pclose(f); }

@@ -114,9 +114,17 @@ int is_ipv6_link_local(const char *text);
 #ifdef __cplusplus
 }
 
+#include <cstdio>
+#include <memory>
 #include <string>
 
 namespace korv {
+/* A stdio stream closed when it goes out of scope. */
+struct file_closer {
+    void operator()(std::FILE *f) const { std::fclose(f); }
+};
+using file_ptr = std::unique_ptr<std::FILE, file_closer>;
+
 /* src with a backslash before each $, ", \ and `, for use inside a
  * double-quoted shell word (the platform's str_insert_back_slash). False
  * (out untouched) for NULL or when memory is short. */

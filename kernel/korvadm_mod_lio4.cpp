@@ -46,10 +46,7 @@ constexpr const char *AUTH_METHOD = "CHAP,None";
 constexpr size_t CHAP_PASS_MIN = 12;
 constexpr size_t CHAP_PASS_MAX = 16;
 
-struct file_closer {
-    void operator()(std::FILE *f) const { std::fclose(f); }
-};
-using file_ptr = std::unique_ptr<std::FILE, file_closer>;
+using korv::file_ptr;
 
 struct dir_closer {
     void operator()(DIR *d) const { closedir(d); }
@@ -475,6 +472,15 @@ int write_tpg_attr(const char *iqn, int tpgt, const char *rel, int value)
     return write_tpg_attr(iqn, tpgt, rel, text, text.c_str());
 }
 
+// Writes a switch of the portal group, then AuthMethod: it stays "CHAP,None"
+// whichever way the switches go, the authentication switch alone decides.
+int write_switch_and_auth_method(const char *iqn, int tpgt, const char *rel, int value)
+{
+    if (write_tpg_attr(iqn, tpgt, rel, value) != 0)
+        return ERR_CONFIGFS;
+    return write_tpg_attr(iqn, tpgt, "/param/AuthMethod", AUTH_METHOD, AUTH_METHOD) == 0 ? KORV_OK : ERR_CONFIGFS;
+}
+
 int _lio3_set_enable_default_policy(const char *iqn, int tpgt, int enable)
 {
     return write_tpg_attr(iqn, tpgt, "/attrib/generate_node_acls", enable ? "1" : "0",
@@ -556,18 +562,7 @@ int _lio3_set_target_enable(const iscsi_target_t *target, int flag)
     }
     if (_lio3_read_target_enable(target) == flag)
         return KORV_OK;
-    std::string tpg = tpg_dir(target->iqn, target->tpgt);
-    std::string enable = tpg + "/enable";
-    if (configfs_write_attr_int(enable.c_str(), flag, 1) != 0) {
-        DBG(0, "set %s = %d failed", enable.c_str(), flag);
-        return ERR_CONFIGFS;
-    }
-    std::string auth = tpg + "/param/AuthMethod";
-    if (configfs_write_attr_str(auth.c_str(), AUTH_METHOD, 1) != 0) {
-        DBG(0, "set %s = CHAP,None failed", auth.c_str());
-        return ERR_CONFIGFS;
-    }
-    return KORV_OK;
+    return write_switch_and_auth_method(target->iqn, target->tpgt, "/enable", flag);
 }
 
 /* ================================================================ portals */
@@ -709,20 +704,7 @@ int _lio3_remove_all_np(const iscsi_target_t *target)
 
 int _lio3_set_target_auth_ability(const char *iqn, int tpgt, int chap_flag)
 {
-    std::string tpg = tpg_dir(iqn, tpgt);
-    std::string auth = tpg + "/attrib/authentication";
-    int value = chap_flag == 1 ? 1 : 0;
-    if (configfs_write_attr_int(auth.c_str(), value, 1) != 0) {
-        DBG(0, "set %s = %d failed", auth.c_str(), value);
-        return ERR_CONFIGFS;
-    }
-    // AuthMethod stays "CHAP,None" either way; the switch alone decides.
-    std::string method = tpg + "/param/AuthMethod";
-    if (configfs_write_attr_str(method.c_str(), AUTH_METHOD, 1) != 0) {
-        DBG(0, "set %s = %s failed", method.c_str(), AUTH_METHOD);
-        return ERR_CONFIGFS;
-    }
-    return KORV_OK;
+    return write_switch_and_auth_method(iqn, tpgt, "/attrib/authentication", chap_flag == 1 ? 1 : 0);
 }
 
 // Writes one name/password pair to an ACL's auth group: `suffix` picks the
