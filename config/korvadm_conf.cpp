@@ -107,7 +107,10 @@ target_map_lun_conf_t *target_map_lun_conf_new(void)
 
 void target_map_lun_conf_free(target_map_lun_conf_t *conf) { free_record(conf); }
 
-void target_map_lun_conf_free_list(list_t *list) { free_records<target_map_lun_conf_t, target_map_lun_conf_free>(list); }
+void target_map_lun_conf_free_list(list_t *list)
+{
+    free_records<target_map_lun_conf_t, target_map_lun_conf_free>(list);
+}
 
 acl_initiator_conf_t *acl_initiator_conf_new(void)
 {

@@ -85,17 +85,7 @@ TEST_F(Settings, AddressesMapInterfacesToTwoSlots)
     EXPECT_EQ(raw("/iscsi/target/IPv6_1"), "2001:db8::1");
 }
 
-TEST_F(Settings, TempReturnCodeReportsAFailedWrite)
-{
-    EXPECT_EQ(xmldb_set_temp_return_code(-9980), KORV_OK);
-    EXPECT_EQ(raw("/temp/iscsi/return_code"), "-9980");
-    db().kill();
-    std::string out;
-    EXPECT_EQ(quiet([&] { return xmldb_set_temp_return_code(1); }, &out), ERR_DB_WRITE);
-    EXPECT_NE(out.find("xmldb_set_int32_t error, return: -9992"), std::string::npos) << out;
-}
-
-TEST_F(Settings, ServiceAndDaemonSwitchesReadUnsetAsZero)
+TEST_F(Settings, ServiceAndDaemonSwitchesAndTheTempReturnCode)
 {
     int v = -1;
     EXPECT_EQ(xmldb_get_nesrad_pid(&v), KORV_OK);  // unset reads 0
@@ -121,6 +111,13 @@ TEST_F(Settings, ServiceAndDaemonSwitchesReadUnsetAsZero)
     EXPECT_STREQ(ip, "isns");
     EXPECT_EQ(xmldb_clean_nesrad_conf(), KORV_OK);
     EXPECT_EQ(raw("/system_mgr/iscsi/iSNS/ip") + raw("/system_mgr/iscsi/iSNS/enable"), "");
+
+    EXPECT_EQ(xmldb_set_temp_return_code(-9980), KORV_OK);
+    EXPECT_EQ(raw("/temp/iscsi/return_code"), "-9980");
+    db().kill();
+    std::string out;
+    EXPECT_EQ(quiet([&] { return xmldb_set_temp_return_code(1); }, &out), ERR_DB_WRITE);
+    EXPECT_NE(out.find("xmldb_set_int32_t error, return: -9992"), std::string::npos) << out;
 }
 
 using WholeStore = StoreTest;

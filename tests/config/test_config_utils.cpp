@@ -47,8 +47,8 @@ TEST_F(TypedAccess, IntegerReadsFollowAtoiButRefuseEmptyOrAbsent)
 TEST_F(TypedAccess, WritesRoundTripAndAnEmptyStringClears)
 {
     EXPECT_EQ(xmldb_set_int32_t(INT32_MIN, "/t/i"), KORV_OK);
-    EXPECT_EQ(raw("/t/i"), "-2147483648");
     EXPECT_EQ(xmldb_set_uint64_t(UINT64_MAX, "/t/u"), KORV_OK);
+    EXPECT_EQ(raw("/t/i") + " " + raw("/t/u"), "-2147483648 18446744073709551615");
     uint64_t u = 0;
     EXPECT_EQ(xmldb_get_uint64_t(&u, "/t/u"), KORV_OK);
     EXPECT_EQ(u, UINT64_MAX);
@@ -70,9 +70,8 @@ TEST_F(TypedAccess, WritesRoundTripAndAnEmptyStringClears)
     EXPECT_EQ(xmldb_get_cstring(buf, 0, "/t/s"), ERR_PARAM);
 
     put("/t/a/b/c", "1");
-    put("/t/a/d", "2");
     EXPECT_EQ(xmldb_delete_node("/t/a"), KORV_OK);
-    EXPECT_EQ(raw("/t/a/b/c") + raw("/t/a/d"), "");
+    EXPECT_EQ(raw("/t/a/b/c"), "");
     EXPECT_EQ(xmldb_delete_node(nullptr), ERR_DB_WRITE);
 }
 
