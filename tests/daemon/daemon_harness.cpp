@@ -20,13 +20,6 @@
 #include "tests/support/isns_isnsd.h"
 #include "tests/support/xmldbd_fixture.h"
 
-#ifndef NESRAD_BIN
-#define NESRAD_BIN "nesrad"
-#endif
-#ifndef NESRAD_TEST_BIN
-#define NESRAD_TEST_BIN "nesrad_short"
-#endif
-
 namespace korv_test {
 
 namespace {
