@@ -223,23 +223,6 @@ struct node_ptr {
     ~node_ptr() { isns_iscsi_node_free(p); }
 };
 
-// Builds the target's node and sends it: as the entity (whose name then
-// sources every later request) or as a further node of it.
-int register_target(const char *iqn, int tpgt, bool as_entity)
-{
-    node_ptr node;
-    if (get_iscsi_node_from_mod(node.p, iqn, tpgt) != 0)
-        return -1;
-    if (as_entity) {
-        copy_bounded(isns_entity_name, sizeof isns_entity_name, iqn);
-        register_entity(node.p);
-    } else {
-        DBG(1, "register iqn=%s", iqn);
-        register_node(node.p);
-    }
-    return 0;
-}
-
 }  // namespace
 
 int get_iscsi_node_from_mod(isns_iscsi_node *node, const char *iqn, int tpgt)
@@ -273,13 +256,23 @@ int get_iscsi_node_from_mod(isns_iscsi_node *node, const char *iqn, int tpgt)
 int target_register_entity_identifier(const char *iqn, int tpgt)
 {
     DBG(1, "register entity=%s", iqn ? iqn : "");
-    return register_target(iqn, tpgt, true);
+    node_ptr node;
+    if (get_iscsi_node_from_mod(node.p, iqn, tpgt) != 0)
+        return -1;
+    copy_bounded(isns_entity_name, sizeof isns_entity_name, iqn);
+    register_entity(node.p);
+    return 0;
 }
 
 int target_register_iSNS_single(const char *iqn, int tpgt)
 {
     DBG(1, "write tpginfo: iqn=%s", iqn ? iqn : "");
-    return register_target(iqn, tpgt, false);
+    node_ptr node;
+    if (get_iscsi_node_from_mod(node.p, iqn, tpgt) != 0)
+        return -1;
+    DBG(1, "register iqn=%s", iqn);
+    register_node(node.p);
+    return 0;
 }
 
 int target_register_iSNS_all(void)
@@ -353,22 +346,6 @@ bool wait_interval(const sigset_t *open_mask)
     return false;
 }
 
-// Stores one resolved address in the transport's globals; 0, or the exit
-// status 1 after printing why.
-int store_server_addr(int family, const void *raw)
-{
-    std::memset(isns_server_addr, 0, sizeof isns_server_addr);
-    if (!inet_ntop(family, raw, isns_server_addr, sizeof isns_server_addr)) {
-        std::puts("get address failed");
-        std::fflush(stdout);
-        DBG(0, "inet_ntop failed");
-        return 1;
-    }
-    isns_addr_family = family;
-    DBG(1, "resolve address as %s", isns_server_addr);
-    return 0;
-}
-
 // Resolves the server once into the transport's address globals.
 // 0, or the exit status 1 after printing why.
 int resolve_server(const char *host)
@@ -378,36 +355,53 @@ int resolve_server(const char *host)
     // sorting, which enumerates interfaces and reads gai.conf and costs the
     // daemon about 300 KiB of resident memory. Other forms (host names,
     // scoped or abbreviated addresses) still go through getaddrinfo.
-    unsigned char raw_addr[sizeof(in6_addr)];
-    for (int family : {AF_INET, AF_INET6})
-        if (inet_pton(family, host, raw_addr) == 1)
-            return store_server_addr(family, raw_addr);
+    unsigned char numeric[sizeof(in6_addr)];
+    sockaddr_storage addr{};
+    const void *raw = nullptr;
+    int family = AF_UNSPEC;
+    for (int f : {AF_INET, AF_INET6}) {
+        if (!raw && inet_pton(f, host, numeric) == 1) {
+            family = f;
+            raw = numeric;
+        }
+    }
+    if (!raw) {
+        addrinfo hints{};
+        hints.ai_family = AF_UNSPEC;
+        hints.ai_socktype = SOCK_STREAM;
+        addrinfo *res = nullptr;
+        int rc = getaddrinfo(host, nullptr, &hints, &res);
+        if (rc != 0 || !res) {
+            DBG(1, "getaddrinfo return %s\n", gai_strerror(rc));
+            if (res)
+                freeaddrinfo(res);
+            return 1;
+        }
+        // Only the first answer counts, whatever the other families offer.
+        family = res->ai_family;
+        std::memcpy(&addr, res->ai_addr,
+                    res->ai_addrlen < sizeof addr ? res->ai_addrlen : sizeof addr);
+        freeaddrinfo(res);
+        if (family == AF_INET)
+            raw = &reinterpret_cast<sockaddr_in *>(&addr)->sin_addr;
+        else if (family == AF_INET6)
+            raw = &reinterpret_cast<sockaddr_in6 *>(&addr)->sin6_addr;
+    }
 
-    addrinfo hints{};
-    hints.ai_family = AF_UNSPEC;
-    hints.ai_socktype = SOCK_STREAM;
-    addrinfo *res = nullptr;
-    int rc = getaddrinfo(host, nullptr, &hints, &res);
-    if (rc != 0 || !res) {
-        DBG(1, "getaddrinfo return %s\n", gai_strerror(rc));
-        if (res)
-            freeaddrinfo(res);
+    std::memset(isns_server_addr, 0, sizeof isns_server_addr);
+    if (!raw) {
+        DBG(0, "get ip address failed");
         return 1;
     }
-    // Only the first answer counts, whatever the other families offer.
-    sockaddr_storage addr{};
-    int family = res->ai_family;
-    std::memcpy(&addr, res->ai_addr,
-                res->ai_addrlen < sizeof addr ? res->ai_addrlen : sizeof addr);
-    freeaddrinfo(res);
-
-    if (family == AF_INET)
-        return store_server_addr(family, &reinterpret_cast<sockaddr_in *>(&addr)->sin_addr);
-    if (family == AF_INET6)
-        return store_server_addr(family, &reinterpret_cast<sockaddr_in6 *>(&addr)->sin6_addr);
-    std::memset(isns_server_addr, 0, sizeof isns_server_addr);
-    DBG(0, "get ip address failed");
-    return 1;
+    if (!inet_ntop(family, raw, isns_server_addr, sizeof isns_server_addr)) {
+        std::puts("get address failed");
+        std::fflush(stdout);
+        DBG(0, "inet_ntop failed");
+        return 1;
+    }
+    isns_addr_family = family;
+    DBG(1, "resolve address as %s", isns_server_addr);
+    return 0;
 }
 
 enum class wake { reload, stop };
