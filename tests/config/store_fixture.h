@@ -2,7 +2,6 @@
 // tree that bypasses the code under test.
 #pragma once
 
-#include <memory>
 #include <string>
 
 #include <gtest/gtest.h>
@@ -27,9 +26,6 @@ auto quiet(Fn fn, std::string *out = nullptr)
 
 class StoreTest : public ::testing::Test {
 protected:
-    void SetUp() override { db_ = std::make_unique<XmldbService>(); }
-    void TearDown() override { db_.reset(); }
-
     // Raw value at path ("" when absent); fails the test when the service does not answer.
     static std::string raw(const std::string &path)
     {
@@ -56,10 +52,10 @@ protected:
         put(tpath(id, "chap_enable"), "0");
     }
 
-    XmldbService &db() { return *db_; }
+    XmldbService &db() { return db_; }
 
 private:
-    std::unique_ptr<XmldbService> db_;
+    XmldbService db_;  // one fresh service per test
 };
 
 }  // namespace korv_test
