@@ -120,8 +120,17 @@ void isnsd_server::stop()
     if (pid_ <= 0)
         return;
     kill(pid_, SIGTERM);
+    // A server that ignores SIGTERM must not hang the test.
+    const auto until = std::chrono::steady_clock::now() + std::chrono::seconds(5);
     int status;
-    waitpid(pid_, &status, 0);
+    while (waitpid(pid_, &status, WNOHANG) == 0) {
+        if (std::chrono::steady_clock::now() > until) {
+            kill(pid_, SIGKILL);
+            waitpid(pid_, &status, 0);
+            break;
+        }
+        std::this_thread::sleep_for(std::chrono::milliseconds(2));
+    }
     pid_ = -1;
     unlink((dir_ + "/isnsd.pid").c_str());
     unlink((dir_ + "/isnsctl").c_str());
