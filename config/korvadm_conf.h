@@ -41,7 +41,7 @@ extern "C" {
 typedef struct target_conf_s {
     int32_t dbidx;
     char name[CONF_NAME_LEN];      /* the key; also called the target suffix */
-    char iqn[CONF_IQN_LEN];        /* not cleared by _new: readers fill it */
+    char iqn[CONF_IQN_LEN];        /* readers fill it before use */
     int32_t tpgt;
     int32_t state;
     int32_t chap_enable;           /* 0/1 */
@@ -70,7 +70,7 @@ typedef struct lun_conf_s {
     char target_name[CONF_NAME_LEN]; /* "" when not mapped */
     int32_t lun_num;
     char reserved_text[CONF_NAME_LEN]; /* for the management logic */
-    char img_file[CONF_IMG_FILE_LEN];  /* not cleared by _new */
+    char img_file[CONF_IMG_FILE_LEN];  /* readers fill it before use */
     list_node_t node;
 } lun_conf_t;
 

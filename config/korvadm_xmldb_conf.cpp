@@ -282,8 +282,10 @@ int _xmldb_get_target_dbidx_by_name(const char *name)
 
 int xmldb_check_target_exist(const char *name)
 {
-    int rc = xmldb_check_add_target(name);
-    return rc == 1 ? 1 : (rc == ERR_PARAM ? ERR_PARAM : 0);
+    PARAM_ERROR_IF(!name);
+    // No target is named "": a plain "no", so callers testing the result as a
+    // truth value are not told it exists.
+    return name[0] && xmldb_check_add_target(name) == 1 ? 1 : 0;
 }
 
 int xmldb_check_add_target(const char *name)
@@ -529,8 +531,9 @@ int xmldb_update_current_targetcnt(void)
     }
     DBG(1, "total running entry=%d", running);
 
-    // A ghost is what an interrupted delete leaves: a status without a name
-    // right after the last target. Only that one position is checked.
+    // A ghost is what an interrupted delete leaves: a status right after the
+    // last counted target. Only that one position is checked, and its name is
+    // not: in a list with a gap, the target at count + 1 goes too.
     char path[kPathLen];
     char status[kPathLen] = "";
     if (xmldb_get_cstring(status, sizeof status, target_path(path, count + 1, "status")) == KORV_OK && status[0]) {

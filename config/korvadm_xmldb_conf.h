@@ -66,7 +66,7 @@ int _xmldb_get_target_dbidx_by_name(const char *name);
 int xmldb_add_new_target(target_conf_t *conf);
 /* Deletes the entry and its subtree; later entries are not renumbered. */
 int xmldb_del_target_by_name(const char *name);
-/* 1 when a target of that name exists, else 0; -9989 for NULL/"". */
+/* 1 when a target of that name exists, else 0 ("" included); -9989 for NULL. */
 int xmldb_check_target_exist(const char *name);
 /* 1 when the name exists, -9979 when 64 others exist, 0 when it can be added. */
 int xmldb_check_add_target(const char *name);
@@ -82,8 +82,10 @@ int xmldb_get_target_iqn(char *buf, size_t size, const char *name);
 int xmldb_set_target_iqn(const char *iqn, const char *name);
 /* chap_enable 0 clears the name and secret; anything but 0/1 is -9989. */
 int xmldb_set_target_chap(int chap_enable, const char *chap_name, const char *chap_pwd, const char *name);
-/* Recounts targets and running targets over 1..64 (gaps included) and removes
- * ghost entries (a status without a name) at count + 1. */
+/* Recounts targets and running targets over 1..64 (gaps included), then
+ * deletes entry count + 1 when it holds a status (a ghost of an interrupted
+ * delete). The name there is not checked: after a delete that left a gap, a
+ * real target at count + 1 is removed too, so rewrite the list first. */
 int xmldb_update_current_targetcnt(void);
 /* size must be at least CONF_NAME_LEN. */
 int xmldb_get_target_status(char *buf, size_t size, const char *name);

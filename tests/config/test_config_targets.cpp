@@ -221,6 +221,7 @@ TEST_F(TargetDelete, LeavesAGapThatHidesLaterTargetsAndConnectionsGoAlone)
     EXPECT_EQ(raw(tpath(3, "name")), "c");
     EXPECT_EQ(xmldb_check_target_exist("c"), 0);
     EXPECT_EQ(xmldb_check_target_exist("a"), 1);
+    EXPECT_EQ(xmldb_check_target_exist(""), 0);  // a plain "no", never a truthy code
     EXPECT_EQ(read_targets(xmldb_get_all_target_conf_lite), "a/1/1");
     EXPECT_EQ(quiet([&] { return xmldb_del_target_by_name("b"); }), ERR_NOT_FOUND);
 
