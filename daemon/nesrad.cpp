@@ -10,6 +10,7 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <cctype>
 #include <cerrno>
 #include <cstdio>
 #include <cstdlib>
@@ -180,15 +181,18 @@ int ipv4_text_to_bytes(unsigned char out[16], const char *text)
     for (int i = 0; i < 4; ++i) {
         size_t dot = rest.find('.');
         std::string_view part = rest.substr(0, dot);
-        // atoi's reading (leading digits, anything after ignored) without
-        // its overflow: the kernel validated the address long before.
-        unsigned long v = 0;
-        for (char c : part) {
-            if (c < '0' || c > '9')
-                break;
-            v = (v * 10 + static_cast<unsigned>(c - '0')) & 0xFFFFu;
-        }
-        out[12 + i] = static_cast<unsigned char>(v);
+        // atoi's reading (leading blanks, a sign, digits, anything after
+        // ignored) without its overflow: only the low byte is kept anyway.
+        size_t at = 0;
+        while (at < part.size() && std::isspace(static_cast<unsigned char>(part[at])))
+            ++at;
+        const bool negative = at < part.size() && part[at] == '-';
+        if (at < part.size() && (part[at] == '-' || part[at] == '+'))
+            ++at;
+        unsigned v = 0;
+        for (; at < part.size() && part[at] >= '0' && part[at] <= '9'; ++at)
+            v = (v * 10 + static_cast<unsigned>(part[at] - '0')) & 0xFFu;
+        out[12 + i] = static_cast<unsigned char>(negative ? 0u - v : v);
         rest = dot == std::string_view::npos ? std::string_view() : rest.substr(dot + 1);
     }
     return 0;

@@ -12,7 +12,6 @@
 #include <poll.h>
 #include <unistd.h>
 
-#include "common/korvadm_log.h"
 #include "isns/isns_internal.h"
 #include "isns/isns_pdu.h"
 
@@ -96,7 +95,6 @@ int open_nonblocking(int family, int *saved, const char *socket_msg)
     if (fd.get() < 0) {
         if (isns_trace)
             printf(socket_msg, errno, strerror(errno));
-        DBG(1, "socket(): %s", strerror(errno));
         return -1;
     }
     const int flags = fcntl(fd.get(), F_GETFL, 0);
@@ -189,20 +187,16 @@ int isns_connect(int *fd, int family, const char *address, int port)
         sockaddr_in sa{};
         sa.sin_family = AF_INET;
         sa.sin_port = htons(static_cast<uint16_t>(port));
-        if (inet_aton(address, &sa.sin_addr) == 0) {
-            DBG(1, "server address \"%s\" is not IPv4", address);
+        if (inet_aton(address, &sa.sin_addr) == 0)
             return -1;
-        }
         isns_connect_timeout = 3;
         rc = connect_non_block(sock.get(), reinterpret_cast<sockaddr *>(&sa), sizeof sa);
     } else if (family == AF_INET6) {
         sockaddr_in6 sa{};
         sa.sin6_family = AF_INET6;
         sa.sin6_port = htons(static_cast<uint16_t>(port));
-        if (inet_pton(AF_INET6, address, &sa.sin6_addr) != 1) {
-            DBG(1, "server address \"%s\" is not IPv6", address);
+        if (inet_pton(AF_INET6, address, &sa.sin6_addr) != 1)
             return -1;
-        }
         if (is_link_local(sa.sin6_addr)) {
             isns_connect_timeout = 1;
             unsigned scopes[3];
@@ -268,10 +262,8 @@ int recv_response(int fd)
         if (recv_pdu_header(fd) < static_cast<int>(sizeof isns_rsp_hdr))
             return 0;
         const int len = static_cast<int>(be16(isns_rsp_hdr + 4));
-        if (total + len > ISNS_PDU_SIZE) {
-            DBG(1, "iSNS response longer than %d bytes", ISNS_PDU_SIZE);
+        if (total + len > ISNS_PDU_SIZE)
             return 0;
-        }
         if (recv_payload(fd, isns_pdu_buf + total, len) < len)
             return 0;
         total += len;
@@ -286,10 +278,9 @@ int send_and_recv(void)
         puts("   send_and_recv()");
         printf("server ip: %s\n", isns_server_addr);
     }
-    if (isns_pdu_overflowed()) {
-        DBG(0, "iSNS message too long, not sent");
+    /* The emitter that refused the attribute has logged why. */
+    if (isns_pdu_overflowed())
         return -1;
-    }
     const size_t total = isns_pdu_len();
     const size_t payload = total - ISNS_HDR_LEN;
     isns_pdu_buf[4] = static_cast<unsigned char>(payload >> 8);
@@ -299,7 +290,6 @@ int send_and_recv(void)
     if (isns_connect(&raw, isns_addr_family, isns_server_addr, ISNS_SERVER_PORT) != 0) {
         if (isns_trace)
             puts("isnsc:   connect_non_block() error");
-        DBG(1, "cannot connect to iSNS server %s", isns_server_addr);
         return -1;
     }
     socket_fd sock(raw);
@@ -318,18 +308,12 @@ int send_and_recv(void)
 
 int _isns_response_status(int n)
 {
-    if (n < 4) {
-        DBG(1, "no valid response from iSNS server %s", isns_server_addr);
+    if (n < 4)
         return -1;
-    }
     isns_last_status = static_cast<int>((static_cast<uint32_t>(isns_pdu_buf[0]) << 24) |
                                         (static_cast<uint32_t>(isns_pdu_buf[1]) << 16) |
                                         (static_cast<uint32_t>(isns_pdu_buf[2]) << 8) | isns_pdu_buf[3]);
     if (isns_trace)
         printf("status = %d\n", isns_last_status);
-    if (isns_last_status != 0) {
-        DBG(1, "iSNS server answered status %d", isns_last_status);
-        return -1;
-    }
-    return n;
+    return isns_last_status != 0 ? -1 : n;
 }

@@ -14,8 +14,9 @@
  * Responses are read into bounded buffers only: a PDU whose length would run
  * past the 10000-byte buffer fails the exchange.
  *
- * Trace output (isns_trace) goes to standard output without the log prefix;
- * failures that stop an exchange are also logged with DBG at level 1. */
+ * Trace output (isns_trace) goes to standard output without the log prefix.
+ * With the trace off the transport is silent whatever the debug level: the
+ * callers report what a failed exchange means. */
 #ifndef ISNS_TRANSPORT_H
 #define ISNS_TRANSPORT_H
 

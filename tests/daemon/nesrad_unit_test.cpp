@@ -106,9 +106,10 @@ TEST(AddressText, HostNameAndIpv4Conversions)
     for (const char *bad : {"1.2.3", "1.2.3.4.5", "", "1234"})
         EXPECT_EQ(-1, ipv4_text_to_bytes(b, bad)) << bad;
     EXPECT_EQ(-1, ipv4_text_to_bytes(b, nullptr));
-    // Huge parts keep their low byte instead of overflowing.
-    ASSERT_EQ(0, ipv4_text_to_bytes(b, "99999999999999999999.0.0.1"));
-    EXPECT_EQ(1, b[15]);
+    // Each part reads like atoi, kept to its low byte without overflowing.
+    ASSERT_EQ(0, ipv4_text_to_bytes(b, "65537. +2.-1.4x"));
+    EXPECT_EQ((std::vector<int>{1, 2, 255, 4}),
+              (std::vector<int>{b[12], b[13], b[14], b[15]}));
 }
 
 TEST_F(InRoot, NodeGetsEveryKernelPortalOrFailsWhenTheyCannotBeListed)

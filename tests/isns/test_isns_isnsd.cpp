@@ -72,15 +72,3 @@ TEST(IsnsOpenIsns, FurtherNodeWithForeignPortalIsRefused)
     isns_iscsi_node_free(t1);
     isns_iscsi_node_free(t2);
 }
-
-TEST(IsnsOpenIsns, PortallessNodeIsStoredWithoutType)
-{
-    // The node type goes with the portal groups, so the server keeps the node
-    // but the type-keyed check does not find it.
-    START_ISNSD(srv, "127.10.4.3", AF_INET, kT1);
-    isns_iscsi_node *t1 = make_node(kT1, 1, {});
-    ASSERT_EQ(register_entity(t1), 0);
-    EXPECT_NE(srv.adm("--list nodes").find(kT1), std::string::npos);
-    EXPECT_EQ(isns_check_registration(kT1), 0);
-    isns_iscsi_node_free(t1);
-}

@@ -7,7 +7,9 @@
 #include <sys/socket.h>
 #include <unistd.h>
 
+#include "common/korvadm_log.h"
 #include "tests/isns/isns_test_util.h"
+#include "tests/support/capture.h"
 
 using namespace isns_test;
 
@@ -113,9 +115,22 @@ TEST(IsnsReceive, StatusStaysReadableAfterFailure)
     ASSERT_TRUE(srv.ok()) << srv.error();
     srv.set_reply(whole(status_rsp(6)));
     reset_client("127.10.2.7");
-    emit_hdr(2);
-    EXPECT_EQ(send_and_recv(), -1);
-    EXPECT_EQ(isns_last_status, 6);
+    // Without its trace the transport prints nothing, whatever the debug
+    // level: a refused status and an unreachable server alike.
+    const int level = g_korv_debug_level;
+    g_korv_debug_level = 4;
+    const std::string out = capture_stdout([] {
+        emit_hdr(2);
+        EXPECT_EQ(send_and_recv(), -1);
+        EXPECT_EQ(isns_last_status, 6);
+        std::snprintf(isns_server_addr, sizeof isns_server_addr, "127.10.2.8");
+        emit_hdr(2);
+        EXPECT_EQ(send_and_recv(), -1);
+        EXPECT_EQ(isns_last_status, 0);
+    });
+    g_korv_debug_level = level;
+    EXPECT_EQ(out, "");
+    reset_client("127.10.2.7");
     EXPECT_EQ(query_entity(kName), -2);
     EXPECT_EQ(deregister_entity(kName), -1);
 }
