@@ -187,18 +187,19 @@ int make_dir_include_parent(const char *path, mode_t mode)
 
 namespace {
 // Missing counts as removed: teardown often runs over half-removed state.
-int remove_entry(const char *path, int (*remove_fn)(const char *), const char *verb)
+// Logs under the caller's name.
+int remove_entry(const char *func, const char *path, int (*remove_fn)(const char *), const char *verb)
 {
     if (!path || !*path)
         return -1;
-    DBG(2, "%s %s ", verb, path);
+    korv_log(2, __FILE__, func, __LINE__, "%s %s ", verb, path);
     return remove_fn(path) == 0 || errno == ENOENT ? 0 : -1;
 }
 }  // namespace
 
 int remove_dir(const char *path)
 {
-    return remove_entry(path, rmdir, "rmdir");
+    return remove_entry(__func__, path, rmdir, "rmdir");
 }
 
 int remove_dir_recurive(const char *path)
@@ -219,7 +220,7 @@ int remove_dir_recurive(const char *path)
 
 int remove_file(const char *path)
 {
-    return remove_entry(path, unlink, "unlink");
+    return remove_entry(__func__, path, unlink, "unlink");
 }
 
 int create_file_if_absent(const char *path, mode_t mode)
@@ -466,6 +467,8 @@ bool store_groups(unsigned char out[16], std::string_view text, int first)
     while (true) {
         size_t colon = text.find(':');
         std::string group(text.substr(0, colon));
+        if (colon == std::string_view::npos && group.empty())
+            return true;  // an empty last group stores nothing
         if (idx < 0 || idx > 7)
             return false;
         unsigned long v = std::strtoul(group.c_str(), nullptr, 16);

@@ -102,8 +102,8 @@ void kill_all_prealloc(void);
  * is refused), else -1. */
 int check_name_chars_valid(const char *text);
 /* Parses IPv6 text into 16 network-order bytes (groups in hexadecimal, "::"
- * zero-filled). Group contents are not validated, but a group that would fall
- * outside the 16 bytes fails. -1 for NULL, fewer than 3 characters or too
+ * zero-filled). Group contents are not validated and an empty last group is
+ * ignored, but a group that would fall outside the 16 bytes fails. -1 for NULL, fewer than 3 characters or too
  * many groups; out is then unspecified. */
 int ipv6_text_to_bytes(unsigned char out[16], const char *text);
 /* 1 when text is a link-local unicast address (fe80::/64: first byte 0xfe,

@@ -21,6 +21,10 @@
 #include "common/korvadm_utils.h"
 #include "platform/platform_util.h"
 
+// Shared helpers log under the name of the operation they work for, so a
+// line names the operation an operator knows.
+#define DBG_AS(func, level, ...) korv_log((level), __FILE__, (func), __LINE__, __VA_ARGS__)
+
 namespace {
 
 constexpr const char *CONFIGFS_MOUNT = "/sys/kernel/config";
@@ -47,6 +51,10 @@ constexpr size_t CHAP_PASS_MIN = 12;
 constexpr size_t CHAP_PASS_MAX = 16;
 
 using korv::file_ptr;
+
+struct free_deleter {
+    void operator()(void *p) const { std::free(p); }
+};
 
 struct dir_closer {
     void operator()(DIR *d) const { closedir(d); }
@@ -298,13 +306,18 @@ int configfs_write_attr_str(const char *path, const char *value, int verify)
     }
     if (!verify)
         return KORV_OK;
-    std::vector<char> read_val(std::strlen(value) + 1, '\0');
-    if (configfs_read_attr_str(path, read_val.data(), read_val.size()) != 0) {
+    size_t read_size = std::strlen(value) + 1;
+    std::unique_ptr<char, free_deleter> read_val(static_cast<char *>(std::calloc(1, read_size)));
+    if (!read_val) {
+        DBG(0, "unable to allocate read_val");
+        return ERR_NO_MEMORY;
+    }
+    if (configfs_read_attr_str(path, read_val.get(), read_size) != 0) {
         DBG(0, "unable to read attribute");
         return ERR_CONFIGFS;
     }
-    if (std::strcmp(value, read_val.data()) != 0) {
-        DBG(0, "write |%s|, but get attribute value = |%s|", value, read_val.data());
+    if (std::strcmp(value, read_val.get()) != 0) {
+        DBG(0, "write |%s|, but get attribute value = |%s|", value, read_val.get());
         return ERR_ATTR_MISMATCH;
     }
     return KORV_OK;
@@ -453,53 +466,55 @@ int lio3_stop_module(void)
 namespace {
 
 // Writes value to the portal group's attribute `rel` and verifies it; the
-// log shows the value as `shown`.
-int write_tpg_attr(const char *iqn, int tpgt, const char *rel, const std::string &value, const char *shown)
+// log shows the value as `shown`, under `func`.
+int write_tpg_attr(const char *func, const char *iqn, int tpgt, const char *rel, const std::string &value,
+                   const char *shown)
 {
     if (!iqn || !tpgt_ok(tpgt))
         return ERR_PARAM;
     std::string path = tpg_dir(iqn, tpgt) + rel;
     if (configfs_write_attr_str(path.c_str(), value.c_str(), 1) != 0) {
-        DBG(0, "set %s = %s failed", path.c_str(), shown);
+        DBG_AS(func, 0, "set %s = %s failed", path.c_str(), shown);
         return ERR_CONFIGFS;
     }
     return KORV_OK;
 }
 
-int write_tpg_attr(const char *iqn, int tpgt, const char *rel, int value)
+int write_tpg_attr(const char *func, const char *iqn, int tpgt, const char *rel, int value)
 {
     std::string text = std::to_string(value);
-    return write_tpg_attr(iqn, tpgt, rel, text, text.c_str());
+    return write_tpg_attr(func, iqn, tpgt, rel, text, text.c_str());
 }
 
 // Writes a switch of the portal group, then AuthMethod: it stays "CHAP,None"
 // whichever way the switches go, the authentication switch alone decides.
-int write_switch_and_auth_method(const char *iqn, int tpgt, const char *rel, int value)
+int write_switch_and_auth_method(const char *func, const char *iqn, int tpgt, const char *rel, int value)
 {
-    if (write_tpg_attr(iqn, tpgt, rel, value) != 0)
+    if (write_tpg_attr(func, iqn, tpgt, rel, value) != 0)
         return ERR_CONFIGFS;
-    return write_tpg_attr(iqn, tpgt, "/param/AuthMethod", AUTH_METHOD, AUTH_METHOD) == 0 ? KORV_OK : ERR_CONFIGFS;
+    return write_tpg_attr(func, iqn, tpgt, "/param/AuthMethod", AUTH_METHOD, AUTH_METHOD) == 0 ? KORV_OK
+                                                                                            : ERR_CONFIGFS;
 }
 
 int _lio3_set_enable_default_policy(const char *iqn, int tpgt, int enable)
 {
-    return write_tpg_attr(iqn, tpgt, "/attrib/generate_node_acls", enable ? "1" : "0",
+    return write_tpg_attr(__func__, iqn, tpgt, "/attrib/generate_node_acls", enable ? "1" : "0",
                           enable ? "Enable" : "Disable");
 }
 
 int _lio3_set_mcs_max_connection(const char *iqn, int tpgt, int max_conn)
 {
-    return write_tpg_attr(iqn, tpgt, "/param/MaxConnections", max_conn);
+    return write_tpg_attr(__func__, iqn, tpgt, "/param/MaxConnections", max_conn);
 }
 
 int _lio3_set_target_alias(const char *iqn, int tpgt, const char *alias)
 {
-    return alias ? write_tpg_attr(iqn, tpgt, "/param/TargetAlias", alias, alias) : ERR_PARAM;
+    return alias ? write_tpg_attr(__func__, iqn, tpgt, "/param/TargetAlias", alias, alias) : ERR_PARAM;
 }
 
 int _lio3_set_target_default_cmdsn_depth(const char *iqn, int tpgt, int depth)
 {
-    return depth >= 0 ? write_tpg_attr(iqn, tpgt, "/attrib/default_cmdsn_depth", depth) : ERR_PARAM;
+    return depth >= 0 ? write_tpg_attr(__func__, iqn, tpgt, "/attrib/default_cmdsn_depth", depth) : ERR_PARAM;
 }
 
 // Every step is tried even after a failure, so one refused attribute does
@@ -562,7 +577,7 @@ int _lio3_set_target_enable(const iscsi_target_t *target, int flag)
     }
     if (_lio3_read_target_enable(target) == flag)
         return KORV_OK;
-    return write_switch_and_auth_method(target->iqn, target->tpgt, "/enable", flag);
+    return write_switch_and_auth_method(__func__, target->iqn, target->tpgt, "/enable", flag);
 }
 
 /* ================================================================ portals */
@@ -626,7 +641,7 @@ bool list_has_address(list_t *list, const iscsi_ip_t *ip, int type)
 
 // Creates the wanted portals of target, every IPv4 one first, leaving out
 // addresses `existing` already holds when it is given. Failures are logged.
-void create_portals(iscsi_target_t *target, list_t *existing)
+void create_portals(const char *func, iscsi_target_t *target, list_t *existing)
 {
     for (int type : {IP_TYPE_V4, IP_TYPE_V6}) {
         for (iscsi_ip_t *ip : korv::list_records<iscsi_ip_t>(&target->ip_list)) {
@@ -634,7 +649,7 @@ void create_portals(iscsi_target_t *target, list_t *existing)
             if (!address[0] || (existing && list_has_address(existing, ip, type)))
                 continue;
             if (_lio3_create_network_portal(target->iqn, target->tpgt, ip->dev_name, address, ip->port, type) != 0)
-                DBG(0, "_lio3_create_network_portal( %s , %d , %s , %s , %d, %s ) return error", target->iqn,
+                DBG_AS(func, 0, "_lio3_create_network_portal( %s , %d , %s , %s , %d, %s ) return error", target->iqn,
                     target->tpgt, ip->dev_name, address, ip->port, ip_type_name(type));
         }
     }
@@ -704,23 +719,23 @@ int _lio3_remove_all_np(const iscsi_target_t *target)
 
 int _lio3_set_target_auth_ability(const char *iqn, int tpgt, int chap_flag)
 {
-    return write_switch_and_auth_method(iqn, tpgt, "/attrib/authentication", chap_flag == 1 ? 1 : 0);
+    return write_switch_and_auth_method(__func__, iqn, tpgt, "/attrib/authentication", chap_flag == 1 ? 1 : 0);
 }
 
 // Writes one name/password pair to an ACL's auth group: `suffix` picks the
 // attributes ("" or "_mutual"), `kind` names the pair in the log.
-int write_acl_credentials(const char *iqn, int tpgt, const char *initiator, const char *suffix, const char *kind,
+int write_acl_credentials(const char *func, const char *iqn, int tpgt, const char *initiator, const char *suffix, const char *kind,
                           const char *user, const char *password)
 {
     std::string auth = tpg_dir(iqn, tpgt) + "/acls/" + initiator + "/auth";
     std::string userid = auth + "/userid" + suffix;
     if (configfs_write_attr_str(userid.c_str(), user, 1) != 0) {
-        DBG(0, "write %s user to %s = %s failed", kind, userid.c_str(), user);
+        DBG_AS(func, 0, "write %s user to %s = %s failed", kind, userid.c_str(), user);
         return ERR_CONFIGFS;
     }
     std::string pass = auth + "/password" + suffix;
     if (configfs_write_attr_str(pass.c_str(), password, 1) != 0) {
-        DBG(0, "write %s password to %s = %s failed", kind, pass.c_str(), password);
+        DBG_AS(func, 0, "write %s password to %s = %s failed", kind, pass.c_str(), password);
         return ERR_CONFIGFS;
     }
     return KORV_OK;
@@ -729,25 +744,25 @@ int write_acl_credentials(const char *iqn, int tpgt, const char *initiator, cons
 int _lio3_set_target_acl_chap(const char *iqn, int tpgt, const char *initiator, const char *user,
                               const char *password)
 {
-    return write_acl_credentials(iqn, tpgt, initiator, "", "chap", user, password);
+    return write_acl_credentials(__func__, iqn, tpgt, initiator, "", "chap", user, password);
 }
 
 int _lio3_set_target_acl_mutual_chap(const char *iqn, int tpgt, const char *initiator, const char *user,
                                      const char *password)
 {
-    return write_acl_credentials(iqn, tpgt, initiator, "_mutual", "mutual chap", user, password);
+    return write_acl_credentials(__func__, iqn, tpgt, initiator, "_mutual", "mutual chap", user, password);
 }
 
 // Writes the credentials the settings switch on to one ACL; mutual CHAP
 // only rides on one-way CHAP.
-int push_chap(const iscsi_target_t *target, const char *initiator)
+int push_chap(const char *func, const iscsi_target_t *target, const char *initiator)
 {
     if (target->chap != 1)
         return KORV_OK;
     std::string user = field(target->chap_user), pass = field(target->chap_pass);
     int rc = _lio3_set_target_acl_chap(target->iqn, target->tpgt, initiator, user.c_str(), pass.c_str());
     if (rc != 0) {
-        DBG(0, "_lio3_set_target_acl_chap return error code: %d", rc);
+        DBG_AS(func, 0, "_lio3_set_target_acl_chap return error code: %d", rc);
         return ERR_CONFIGFS;
     }
     if (target->mutual_chap == 1) {
@@ -755,7 +770,7 @@ int push_chap(const iscsi_target_t *target, const char *initiator)
         rc = _lio3_set_target_acl_mutual_chap(target->iqn, target->tpgt, initiator, muser.c_str(),
                                               mpass.c_str());
         if (rc != 0) {
-            DBG(0, "_lio3_set_target_acl_mutual_chap return error code: %d", rc);
+            DBG_AS(func, 0, "_lio3_set_target_acl_mutual_chap return error code: %d", rc);
             return ERR_CONFIGFS;
         }
     }
@@ -771,7 +786,7 @@ int _lio3_set_target_chap_all_acl(const iscsi_target_t *target)
         return ERR_CONFIGFS;
     }
     for (const std::string &name : names)
-        if (push_chap(target, name.c_str()) != 0)
+        if (push_chap(__func__, target, name.c_str()) != 0)
             return ERR_CONFIGFS;
     return KORV_OK;
 }
@@ -813,16 +828,16 @@ int remove_configfs_group(const std::string &path, int depth = 0)
 }
 
 // Removes every sub-directory of dir, ignoring single failures.
-int remove_all_subdirs(const std::string &dir)
+int remove_all_subdirs(const char *func, const std::string &dir)
 {
     std::vector<std::string> names;
     if (!list_subdirs(dir, names)) {
-        DBG(0, "can not open directory : %s", dir.c_str());
+        DBG_AS(func, 0, "can not open directory : %s", dir.c_str());
         return ERR_PARAM;
     }
     for (const std::string &name : names)
         if (remove_configfs_group(dir + "/" + name) != 0)
-            DBG(2, "remove %s/%s failed", dir.c_str(), name.c_str());
+            DBG_AS(func, 2, "remove %s/%s failed", dir.c_str(), name.c_str());
     return KORV_OK;
 }
 
@@ -982,7 +997,7 @@ int lio3_set_target_ip(iscsi_target_t *target)
     CHECK_TARGET(target, "target is NULL", "target IQN is empty", "target TPGT out of limitation");
     if (_lio3_remove_all_np(target) != 0)
         DBG(0, "_lio3_remove_all_np error");
-    create_portals(target, nullptr);
+    create_portals(__func__, target, nullptr);
     return KORV_OK;
 }
 
@@ -992,7 +1007,7 @@ int lio3_set_target_ip_v2(iscsi_target_t *target)
     ip_list_guard existing;
     if (_get_exist_ip_list(target, &existing.list) != 0)
         DBG(0, "_get_exist_ip_list error");
-    create_portals(target, &existing.list);
+    create_portals(__func__, target, &existing.list);
     for (iscsi_ip_t *ip : korv::list_records<iscsi_ip_t>(&existing.list)) {
         for (int type : {IP_TYPE_V4, IP_TYPE_V6}) {
             const char *address = ip_address(ip, type);
@@ -1023,20 +1038,20 @@ int lio3_get_target_existing_ip_list(list_t *ip_list, iscsi_target_t *target)
 namespace {
 // A name is given and the password is 12 to 16 characters; `kind` and the
 // two messages name the pair in the log.
-bool chap_pair_ok(const char (&user)[ISCSI_NAME_LEN], const char (&pass)[ISCSI_NAME_LEN], const char *kind,
+bool chap_pair_ok(const char *func, const char (&user)[ISCSI_NAME_LEN], const char (&pass)[ISCSI_NAME_LEN], const char *kind,
                   const char *no_name, const char *no_pass)
 {
     size_t len = strnlen(pass, sizeof pass);
     if (user[0] == '\0') {
-        DBG(0, "%s", no_name);
+        DBG_AS(func, 0, "%s", no_name);
         return false;
     }
     if (len == 0) {
-        DBG(0, "%s", no_pass);
+        DBG_AS(func, 0, "%s", no_pass);
         return false;
     }
     if (len < CHAP_PASS_MIN || len > CHAP_PASS_MAX) {
-        DBG(0, "%s enabled, but %s password length = %u is not between 12 to 16", kind, kind,
+        DBG_AS(func, 0, "%s enabled, but %s password length = %u is not between 12 to 16", kind, kind,
             static_cast<unsigned>(len));
         return false;
     }
@@ -1052,12 +1067,12 @@ int _lio3_validate_target_chap_settings(const iscsi_target_t *target)
     }
     if (target->chap != 1)
         return 1;
-    if (!chap_pair_ok(target->chap_user, target->chap_pass, "CHAP", "CHAP Enabled, but CHAP name is not given",
+    if (!chap_pair_ok(__func__, target->chap_user, target->chap_pass, "CHAP", "CHAP Enabled, but CHAP name is not given",
                       "CHAP enabled, but CHAP password is not given"))
         return 0;
     if (target->mutual_chap != 1)
         return 1;
-    return chap_pair_ok(target->mutual_user, target->mutual_pass, "Mutual CHAP",
+    return chap_pair_ok(__func__, target->mutual_user, target->mutual_pass, "Mutual CHAP",
                         "Mutual CHAP enabled, but Mutual CHAP name is not given",
                         "Mutual CHAP Enabled, but Mutual CHAP Password is not given")
                ? 1
@@ -1075,7 +1090,7 @@ int _lio3_set_target_chap_to_acl(const char *initiator_iqn, iscsi_target_t *targ
         DBG(0, "CHAP setting is not correct");
         return ERR_PARAM;
     }
-    return push_chap(target, initiator_iqn);
+    return push_chap(__func__, target, initiator_iqn);
 }
 
 int lio3_set_target_chap(iscsi_target_t *target)
@@ -1189,7 +1204,7 @@ int _lio3_remove_fileio_device(iscsi_lun_t *lun)
     std::string name = field(lun->name);
     std::string backstore = fileio_dir(lun->hba_id, name);
     if (configfs_path_exist(backstore.c_str()) != 0) {
-        DBG(2, "the lun fileio device : %s is already removed", backstore.c_str());
+        DBG(0, "the lun fileio device : %s is already removed", backstore.c_str());
         return KORV_OK;
     }
     std::string serial = field(lun->serial);
@@ -1237,14 +1252,14 @@ int _lio3_remove_all_acl(iscsi_target_t *target)
 {
     if (check_target(target) != tcheck::ok)
         return ERR_PARAM;
-    return remove_all_subdirs(tpg_dir(target->iqn, target->tpgt) + "/acls");
+    return remove_all_subdirs(__func__, tpg_dir(target->iqn, target->tpgt) + "/acls");
 }
 
 int _lio3_remove_all_lun(iscsi_target_t *target)
 {
     if (check_target(target) != tcheck::ok)
         return ERR_PARAM;
-    return remove_all_subdirs(tpg_dir(target->iqn, target->tpgt) + "/lun");
+    return remove_all_subdirs(__func__, tpg_dir(target->iqn, target->tpgt) + "/lun");
 }
 
 int _lio3_remove_all_tpgt(iscsi_target_t *target)

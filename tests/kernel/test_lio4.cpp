@@ -251,6 +251,10 @@ TEST_F(Lio4Test, ChapPasswordLengthAndMutualOnlyWithOneWay)
         std::strcpy(t->chap_pass, std::string(len, 'p').c_str());
         EXPECT_EQ(_lio3_validate_target_chap_settings(t), valid) << len;
     }
+    std::strcpy(t->chap_pass, std::string(17, 'p').c_str());
+    std::string log = capture_stdout([&] { _lio3_validate_target_chap_settings(t); });
+    EXPECT_NE(log.find("(korvadm_mod_lio4:_lio3_validate_target_chap_settings:"), std::string::npos) << log;
+    EXPECT_NE(log.find("CHAP enabled, but CHAP password length = 17 is not between 12 to 16"), std::string::npos);
     std::strcpy(t->chap_pass, "twelve-chars");
     t->chap_user[0] = '\0';
     EXPECT_EQ(_lio3_validate_target_chap_settings(t), 0);
@@ -348,6 +352,13 @@ TEST_F(Lio4Test, TargetChecksComeFirst)
     std::memset(t->iqn, 'a', sizeof t->iqn);  // no terminator in the field
     EXPECT_EQ(lio3_add_target(t), ERR_PARAM);
     EXPECT_EQ(lio3_add_target(nullptr), ERR_PARAM);
+
+    // An unreadable switch counts as enabled, so disabling writes it; the
+    // failure is logged under the setter's name.
+    std::strcpy(t->iqn, IQN);
+    std::string log = capture_stdout([&] { EXPECT_EQ(lio3_disable_target(t), ERR_CONFIGFS); });
+    EXPECT_NE(log.find("(korvadm_mod_lio4:_lio3_set_target_enable:"), std::string::npos) << log;
+    EXPECT_NE(log.find(tpg() + "/enable = 0 failed"), std::string::npos);
     EXPECT_FALSE(exists(at("/sys")));
 }
 
@@ -370,6 +381,10 @@ TEST_F(Lio4Test, GroupRemovalUnlinksLinksWithoutFollowingThem)
     iscsi_lun_t lun{};  // a LUN naming no backstore directory is refused
     std::strcpy(lun.name, "../x");
     EXPECT_EQ(lio3_shutdown_backstore(&lun), ERR_PARAM);
+    std::strcpy(lun.name, "gone");  // an absent backstore is done, and said so at error level
+    lun.hba_id = 0;
+    std::string log = capture_stdout([&] { EXPECT_EQ(lio3_shutdown_backstore(&lun), 0); });
+    EXPECT_NE(log.find("the lun fileio device : "), std::string::npos) << log;
 }
 
 }  // namespace

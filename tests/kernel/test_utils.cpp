@@ -205,11 +205,13 @@ TEST_F(UtilsTest, NameCharacters)
 TEST_F(UtilsTest, Ipv6TextToBytesAgreesWithTheCLibrary)
 {
     unsigned char got[16], want[16];
-    for (const char *text : {"fe80::1", "::1", "2001:db8::8:800:200c:417a", "1:2:3:4:5:6:7:8", "fd00::"}) {
+    for (const char *text : {"fe80::1", "::1", "2001:db8::8:800:200c:417a", "fd00::", "1:2:3:4:5:6:7:8"}) {
         ASSERT_EQ(inet_pton(AF_INET6, text, want), 1) << text;
         ASSERT_EQ(ipv6_text_to_bytes(got, text), 0) << text;
         EXPECT_EQ(std::memcmp(got, want, 16), 0) << text;
     }
+    ASSERT_EQ(ipv6_text_to_bytes(got, "1:2:3:4:5:6:7:8:"), 0);  // a trailing ':' adds no group
+    EXPECT_EQ(std::memcmp(got, want, 16), 0);
     // Groups that would land outside the 16 bytes.
     EXPECT_EQ(ipv6_text_to_bytes(got, "1:2:3:4:5:6:7:8:9"), -1);
     EXPECT_EQ(ipv6_text_to_bytes(got, "::1:2:3:4:5:6:7:8:9"), -1);
