@@ -1284,6 +1284,10 @@ int _lio3_remove_all_tpgt(iscsi_target_t *target)
             rc = ERR_CONFIGFS;
         }
     }
+    // Every group's deletion but the last fails to remove the IQN directory,
+    // which still holds the others: what counts is whether the target is gone.
+    if (rc != 0 && configfs_path_exist(dir.c_str()) != 0)
+        rc = KORV_OK;
     return rc;
 }
 

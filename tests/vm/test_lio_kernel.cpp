@@ -231,6 +231,11 @@ TEST_F(LioModules, StopTearsDownEverythingTheKernelHolds)
     ASSERT_EQ(lio3_enable_target(t.get()), 0);
     Target second = make_target("iqn.2026-01.vm:stop-second", 2);
     ASSERT_EQ(lio3_add_target(second.get()), 0);
+    // Two portal groups under each IQN: the first group's deletion cannot
+    // remove its IQN yet, which must not end the walk over the others.
+    Target full2 = make_target("iqn.2026-01.vm:stop-full", 2), second1 = make_target("iqn.2026-01.vm:stop-second", 1);
+    ASSERT_EQ(lio3_add_target(full2.get()), 0);
+    ASSERT_EQ(lio3_add_target(second1.get()), 0);
     hand_made_backstore("fileio_3", "sparedisk"); // mapped nowhere
     // With configuration present the kernel refuses to unload the modules,
     // so the driver must have emptied configfs first, in an order it accepts.
