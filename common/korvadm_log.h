@@ -29,4 +29,8 @@ void korv_log(int level, const char *file, const char *func, int line, const cha
 
 #define DBG(level, ...) korv_log((level), __FILE__, __func__, __LINE__, __VA_ARGS__)
 
+/* For a helper shared by several operations: the line names `func`, the
+ * operation it works for, which is the name an operator knows. */
+#define DBG_AS(func, level, ...) korv_log((level), __FILE__, (func), __LINE__, __VA_ARGS__)
+
 #endif

@@ -119,7 +119,7 @@ constexpr size_t kModeLen = 16;
 int copy_dev_name(const char *func, char *dev_name, const char *dev)
 {
     if (!dev_name) {
-        korv_log(0, __FILE__, func, __LINE__, "dev_name is NULL");
+        DBG_AS(func, 0, "dev_name is NULL");
         return ERR_PARAM;
     }
     std::snprintf(dev_name, ISCSI_IP_DEV_LEN, "%s", dev);

@@ -192,7 +192,7 @@ int remove_entry(const char *func, const char *path, int (*remove_fn)(const char
 {
     if (!path || !*path)
         return -1;
-    korv_log(2, __FILE__, func, __LINE__, "%s %s ", verb, path);
+    DBG_AS(func, 2, "%s %s ", verb, path);
     return remove_fn(path) == 0 || errno == ENOENT ? 0 : -1;
 }
 }  // namespace

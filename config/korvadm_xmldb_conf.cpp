@@ -16,8 +16,6 @@
 #include "platform/platform_util.h"
 #include "platform/xmldbc.h"
 
-// Shared helpers log under the operation that called them.
-#define LOG_AS(func, level, ...) korv_log((level), __FILE__, (func), __LINE__, __VA_ARGS__)
 // An operation's argument guard: logged under the operation, -9989.
 #define PARAM_ERROR_IF(refused)        \
     do {                               \
@@ -145,7 +143,7 @@ int adjust_counter(const char *func, const char *path, int delta, const char *fa
     else
         count = 0;
     if (xmldb_set_int32_t(count, path) != KORV_OK) {
-        LOG_AS(func, 0, fail_fmt, count);
+        DBG_AS(func, 0, fail_fmt, count);
         return ERR_DB_WRITE;
     }
     return KORV_OK;
@@ -200,13 +198,13 @@ int find_target(const char *func, const char *name)
     case ID_ENTRY_FOUND:
         return n;
     case ERR_PARAM:
-        LOG_AS(func, 0, "_search_xmldb_id_entry failed");
+        DBG_AS(func, 0, "_search_xmldb_id_entry failed");
         return ERR_DB_WRITE;
     case ID_ENTRY_NOT_FOUND:
-        LOG_AS(func, 2, "can not find %s in xmldb target entry", name);
+        DBG_AS(func, 2, "can not find %s in xmldb target entry", name);
         return ERR_NOT_FOUND;
     default:
-        LOG_AS(func, 0, "IT SHOULD NEVER BE HERE, func_ret = %d", rc);
+        DBG_AS(func, 0, "IT SHOULD NEVER BE HERE, func_ret = %d", rc);
         return ERR_DB_WRITE;
     }
 }
@@ -214,7 +212,7 @@ int find_target(const char *func, const char *name)
 int get_target_int(const char *func, int *out, const char *name, const char *field)
 {
     if (!out || !name) {
-        LOG_AS(func, 0, "parameter error");
+        DBG_AS(func, 0, "parameter error");
         return ERR_PARAM;
     }
     int n = find_target(func, name);
@@ -225,11 +223,11 @@ int get_target_int(const char *func, int *out, const char *name, const char *fie
     int32_t v = 0;
     int rc = xmldb_get_int32_t(&v, path);
     if (rc == ERR_INT_VALUE) {
-        LOG_AS(func, 0, "get %s = %d => failed", path, v);
+        DBG_AS(func, 0, "get %s = %d => failed", path, v);
         return rc;
     }
     if (rc != KORV_OK) {
-        LOG_AS(func, 0, "get %s failed", path);
+        DBG_AS(func, 0, "get %s failed", path);
         return rc;
     }
     *out = v;
@@ -239,7 +237,7 @@ int get_target_int(const char *func, int *out, const char *name, const char *fie
 int set_target_int(const char *func, int value, const char *name, const char *field)
 {
     if (!name) {
-        LOG_AS(func, 0, "parameter error");
+        DBG_AS(func, 0, "parameter error");
         return ERR_PARAM;
     }
     int n = find_target(func, name);
@@ -248,7 +246,7 @@ int set_target_int(const char *func, int value, const char *name, const char *fi
     char path[kPathLen];
     target_path(path, n, field);
     if (xmldb_set_int32_t(value, path) != KORV_OK) {
-        LOG_AS(func, 0, "set %s = %d failed", path, value);
+        DBG_AS(func, 0, "set %s = %d failed", path, value);
         return ERR_DB_WRITE;
     }
     return KORV_OK;
@@ -261,7 +259,7 @@ int get_target_text(const char *func, int n, const char *field, char *buf, size_
     buf[0] = '\0';
     int rc = xmldb_get_cstring(buf, size, path);
     if (rc != KORV_OK)
-        LOG_AS(func, 0, "get %s failed", path);
+        DBG_AS(func, 0, "get %s failed", path);
     return rc;
 }
 }  // namespace
@@ -593,7 +591,7 @@ int fill_target_conf(const char *func, target_conf_t *conf, int n, bool full)
         if (!f.on)
             continue;
         if ((rc = xmldb_get_int32_t(f.out, target_path(path, n, f.field))) != KORV_OK) {
-            LOG_AS(func, 0, "%s", f.fail);
+            DBG_AS(func, 0, "%s", f.fail);
             *f.out = -1;
             return rc;
         }
@@ -601,23 +599,23 @@ int fill_target_conf(const char *func, target_conf_t *conf, int n, bool full)
     if (!full)
         return KORV_OK;
     if ((rc = xmldb_get_cstring(conf->iqn, sizeof conf->iqn, target_path(path, n, "iqn"))) != KORV_OK) {
-        LOG_AS(func, 0, "get %s failed", path);
+        DBG_AS(func, 0, "get %s failed", path);
         return rc;
     }
     if (conf->chap_enable == 1) {
         if ((rc = xmldb_get_cstring(conf->chap_name, sizeof conf->chap_name, target_path(path, n, "chap_name"))) !=
             KORV_OK) {
-            LOG_AS(func, 0, "get target chap_name error");
+            DBG_AS(func, 0, "get target chap_name error");
             return rc;
         }
         if ((rc = xmldb_get_cstring(conf->chap_pwd, sizeof conf->chap_pwd, target_path(path, n, "chap_pwd"))) !=
             KORV_OK) {
-            LOG_AS(func, 0, "get target chap_password error");
+            DBG_AS(func, 0, "get target chap_password error");
             return rc;
         }
     }
     if ((rc = xmldb_get_cstring(conf->status, sizeof conf->status, target_path(path, n, "status"))) != KORV_OK) {
-        LOG_AS(func, 0, "get %s failed", path);
+        DBG_AS(func, 0, "get %s failed", path);
         return rc;
     }
     return KORV_OK;
@@ -628,7 +626,7 @@ int fill_target_conf(const char *func, target_conf_t *conf, int n, bool full)
 int read_all_targets(const char *func, list_t *out, bool full)
 {
     if (!out) {
-        LOG_AS(func, 0, "parameter error");
+        DBG_AS(func, 0, "parameter error");
         return ERR_PARAM;
     }
     list_t got;
@@ -640,14 +638,14 @@ int read_all_targets(const char *func, list_t *out, bool full)
         if (!read_key(kTargetRoot, n, "name", name, &read_rc)) {
             if (read_rc != KORV_OK) {
                 char path[kPathLen];
-                LOG_AS(func, 0, "xmldbc_get(%s) failed", target_path(path, n, "name"));
+                DBG_AS(func, 0, "xmldbc_get(%s) failed", target_path(path, n, "name"));
                 rc = read_rc;
             }
             break;
         }
         target_conf_t *conf = target_conf_new();
         if (!conf) {
-            LOG_AS(func, 0, "new t_conf failed error");
+            DBG_AS(func, 0, "new t_conf failed error");
             rc = ERR_NO_MEMORY;
             break;
         }
@@ -762,12 +760,12 @@ int saved_addr_slot(const char *dev_name)
 int get_saved_addr(const char *func, char *buf, size_t size, const char *dev_name, const char *fmt)
 {
     if (!buf || !dev_name || !dev_name[0]) {
-        LOG_AS(func, 0, "parameter error");
+        DBG_AS(func, 0, "parameter error");
         return ERR_PARAM;
     }
     int slot = saved_addr_slot(dev_name);
     if (!slot) {
-        LOG_AS(func, 0, "unknown interface %s", dev_name);
+        DBG_AS(func, 0, "unknown interface %s", dev_name);
         return ERR_NOT_FOUND;
     }
     char path[kPathLen];
@@ -781,17 +779,17 @@ int get_saved_addr(const char *func, char *buf, size_t size, const char *dev_nam
 int set_saved_addr(const char *func, const char *addr, const char *dev_name, const char *fmt)
 {
     if (!addr || !addr[0] || !dev_name || !dev_name[0]) {
-        LOG_AS(func, 0, "parameter error");
+        DBG_AS(func, 0, "parameter error");
         return ERR_PARAM;
     }
     int slot = saved_addr_slot(dev_name);
     if (!slot) {
-        LOG_AS(func, 0, "unknown interface %s", dev_name);
+        DBG_AS(func, 0, "unknown interface %s", dev_name);
         return ERR_NOT_FOUND;
     }
     char path[kPathLen];
     pathf(path, sizeof path, fmt, slot);
-    LOG_AS(func, 2, "set %s = %s", path, addr);
+    DBG_AS(func, 2, "set %s = %s", path, addr);
     return xmldb_set_cstring(addr, path) == KORV_OK ? KORV_OK : ERR_DB_WRITE;
 }
 

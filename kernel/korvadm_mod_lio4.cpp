@@ -21,9 +21,6 @@
 #include "common/korvadm_utils.h"
 #include "platform/platform_util.h"
 
-// Shared helpers log under the name of the operation they work for, so a
-// line names the operation an operator knows.
-#define DBG_AS(func, level, ...) korv_log((level), __FILE__, (func), __LINE__, __VA_ARGS__)
 
 namespace {
 
