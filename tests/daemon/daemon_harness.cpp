@@ -1,16 +1,18 @@
 // The appliance in a test root, the daemon as a real process, isnsadm's view.
 #include "tests/daemon/daemon_harness.h"
 
-#include <dirent.h>
 #include <fcntl.h>
 #include <signal.h>
 #include <sys/prctl.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cstdio>
 #include <cstdlib>
+#include <filesystem>
 #include <fstream>
+#include <iterator>
 #include <map>
 #include <sstream>
 
@@ -31,16 +33,10 @@ void set_host_name(const std::string &name)
     SysRoot::write("/proc/sys/kernel/hostname", name + "\n");
 }
 
-std::string target_iqn(const std::string &entity_id, const std::string &target)
-{
-    return std::string(kPrefix) + entity_id + ":" + target;
-}
-
-void store_targets(const std::string &entity_id, const std::vector<target_spec> &targets,
-                   int debug_level)
+void store_targets(const std::string &entity_id, const std::vector<target_spec> &targets)
 {
     ASSERT_EQ(0, dbSetStr(kPrefix, "/iscsi/target/iqn_prefix"));
-    ASSERT_EQ(0, dbSetLL(debug_level, "/iscsi/target/dbg"));
+    ASSERT_EQ(0, dbSetLL(1, "/iscsi/target/dbg"));
     // The reader's walk ends only at an entry without a name: clear what an
     // earlier call may have stored beyond the list.
     for (size_t i = 1; i <= 64; ++i)
@@ -58,10 +54,8 @@ void store_targets(const std::string &entity_id, const std::vector<target_spec> 
     for (const target_spec &t : targets) {
         std::string np = std::string(kConfigfsIscsi) + "/" + target_iqn(entity_id, t.name) +
                          "/tpgt_" + std::to_string(t.tpgt) + "/np";
-        if (t.in_kernel)
-            SysRoot::mkdirs(np);
-        for (const std::string &portal : t.in_kernel ? t.portals : std::vector<std::string>{})
-            SysRoot::mkdirs(np + "/" + portal);
+        for (size_t i = 0; t.in_kernel && i <= t.portals.size(); ++i)
+            SysRoot::mkdirs(i ? np + "/" + t.portals[i - 1] : np);
     }
 }
 
@@ -110,10 +104,8 @@ daemon_process::daemon_process(const std::string &binary, const std::string &ser
 {
     char tmpl[] = "/tmp/nesrad-log-XXXXXX";
     int fd = mkstemp(tmpl);
-    if (fd < 0) {
-        ADD_FAILURE() << "mkstemp failed";
-        return;
-    }
+    if (fd < 0)
+        ADD_FAILURE() << "mkstemp";
     log_ = tmpl;
     std::vector<std::string> words = std::move(wrapper);
     words.push_back(binary);
@@ -128,8 +120,7 @@ daemon_process::daemon_process(const std::string &binary, const std::string &ser
         sigset_t none;
         sigemptyset(&none);
         sigprocmask(SIG_SETMASK, &none, nullptr);
-        for (int i = 3; i < 1024; ++i)
-            close(i);
+        close_range(3, ~0U, 0);
         std::vector<char *> argv;
         for (std::string &w : words)
             argv.push_back(w.data());
@@ -168,9 +159,7 @@ int daemon_process::wait_exit(std::chrono::milliseconds limit)
 std::string daemon_process::output() const
 {
     std::ifstream in(log_);
-    std::stringstream ss;
-    ss << in.rdbuf();
-    return ss.str();
+    return {std::istreambuf_iterator<char>(in), {}};
 }
 
 int daemon_process::count(const std::string &text) const
@@ -193,24 +182,22 @@ daemon_process::arrivals(const std::string &text, int n, std::chrono::millisecon
     std::vector<std::chrono::steady_clock::time_point> seen;
     eventually(
         [&] {
-            for (int c = count(text); static_cast<int>(seen.size()) < std::min(c, n);)
-                seen.push_back(std::chrono::steady_clock::now());
+            seen.resize(std::min(count(text), n), std::chrono::steady_clock::now());
             return static_cast<int>(seen.size()) >= n;
         },
         limit);
     return seen;
 }
 
-int daemon_process::open_fds(int below) const
+int daemon_process::open_fds() const
 {
-    DIR *dir = pid_ > 0 ? opendir(("/proc/" + std::to_string(pid_) + "/fd").c_str()) : nullptr;
-    if (!dir)
+    std::error_code ec;
+    auto fds = std::filesystem::directory_iterator("/proc/" + std::to_string(pid_) + "/fd", ec);
+    if (ec)
         return -1;
-    int n = 0;
-    while (dirent *e = readdir(dir))
-        n += e->d_name[0] != '.' && std::atoi(e->d_name) < below;
-    closedir(dir);
-    return n;
+    return static_cast<int>(std::count_if(begin(fds), end(fds), [&](const auto &e) {
+        return std::stoi(e.path().filename().string()) < 1024;
+    }));
 }
 
 }  // namespace korv_test

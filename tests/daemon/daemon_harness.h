@@ -6,12 +6,12 @@
 #pragma once
 
 #include <sys/types.h>
-#include <time.h>
 
 #include <chrono>
 #include <initializer_list>
 #include <set>
 #include <string>
+#include <thread>
 #include <vector>
 
 namespace korv_test {
@@ -32,15 +32,17 @@ struct target_spec {
 // Writes "<root>/proc/sys/kernel/hostname".
 void set_host_name(const std::string &name);
 
-// Stores the IQN prefix, the debug level and the targets (entries 1..n,
+// Stores the IQN prefix, debug level 1 and the targets (entries 1..n,
 // anything stored beyond them removed) in the running configuration
 // service, and creates each target's portal directories for the IQN the
 // daemon will build for host `entity_id`. Previous portal directories go.
-void store_targets(const std::string &entity_id, const std::vector<target_spec> &targets,
-                   int debug_level = 1);
+void store_targets(const std::string &entity_id, const std::vector<target_spec> &targets);
 
 // prefix + entity_id + ":" + target.
-std::string target_iqn(const std::string &entity_id, const std::string &target);
+inline std::string target_iqn(const std::string &entity_id, const std::string &target)
+{
+    return kPrefix + entity_id + ":" + target;
+}
 
 // The stored daemon pid ("/system_mgr/iscsi/iSNS/pid"); -1 when unreadable.
 long long stored_pid();
@@ -81,9 +83,9 @@ public:
     // (fewer when the time ran out).
     std::vector<std::chrono::steady_clock::time_point> arrivals(const std::string &text, int n,
                                                                 std::chrono::milliseconds limit) const;
-    // Open descriptors of the running process below `below` (valgrind's own
+    // Open descriptors of the running process below 1024 (valgrind's own
     // sit high); -1 when unreadable.
-    int open_fds(int below = 1 << 30) const;
+    int open_fds() const;
 
 private:
     pid_t pid_ = -1;
@@ -94,15 +96,11 @@ private:
 template <class Pred>
 bool eventually(Pred pred, std::chrono::milliseconds limit)
 {
-    auto end = std::chrono::steady_clock::now() + limit;
-    for (;;) {
-        if (pred())
-            return true;
-        if (std::chrono::steady_clock::now() >= end)
+    using namespace std::chrono;
+    for (auto end = steady_clock::now() + limit; !pred(); std::this_thread::sleep_for(milliseconds(50)))
+        if (steady_clock::now() >= end)
             return false;
-        struct timespec ts{0, 50 * 1000 * 1000};
-        nanosleep(&ts, nullptr);
-    }
+    return true;
 }
 
 }  // namespace korv_test
