@@ -30,14 +30,8 @@ inline void reset_client(const char *server, int family = AF_INET)
 // 16-byte portal address from IPv4 (mapped) or IPv6 text.
 inline void portal_addr(const char *text, unsigned char out[16])
 {
-    std::memset(out, 0, 16);
-    in_addr a4;
-    if (inet_pton(AF_INET, text, &a4) == 1) {
-        out[10] = out[11] = 0xff;
-        std::memcpy(out + 12, &a4, 4);
-    } else {
-        inet_pton(AF_INET6, text, out);
-    }
+    const std::string t = std::strchr(text, ':') ? text : std::string("::ffff:") + text;
+    inet_pton(AF_INET6, t.c_str(), out);
 }
 
 // A node with the given portals (addresses as text, one port for all).

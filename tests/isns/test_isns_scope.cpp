@@ -91,30 +91,23 @@ int scope_case(const std::vector<std::string> &ifaces, const std::string &holder
     return name == holder ? 0 : why(1, std::string("connected through ") + name + ", expected " + holder);
 }
 
-void expect_case(const std::vector<std::string> &ifaces, const std::string &holder, double min_s, double max_s)
-{
-    const int rc = korv_test::run_in_child([&] { return scope_case(ifaces, holder, min_s, max_s); });
-    if (rc == kSkip)
-        GTEST_SKIP() << "no private network namespace with test interfaces here (reason above)";
-    EXPECT_EQ(rc, 0) << "holder " << holder << " (details above)";
-}
-
 }  // namespace
 
-TEST(IsnsLinkLocal, Bond0IsTriedFirstWhenPresent)
+TEST(IsnsLinkLocal, ScopesAreTriedBond0FirstThenEth0AndEth1OneSecondEach)
 {
-    expect_case({"bond0", "eth0", "eth1"}, "bond0", 0.0, 0.8);
-    expect_case({"bond0", "eth0", "eth1"}, "eth0", 0.9, 1.9);
-    expect_case({"bond0", "eth0", "eth1"}, "eth1", 1.9, 2.9);
-}
-
-TEST(IsnsLinkLocal, Bond0IsSkippedWhenAbsent)
-{
-    expect_case({"eth0", "eth1"}, "eth0", 0.0, 0.8);
-    expect_case({"eth0", "eth1"}, "eth1", 0.9, 1.9);
-}
-
-TEST(IsnsLinkLocal, NoScopeAnswersAfterOneSecondEach)
-{
-    expect_case({"bond0", "eth0", "eth1"}, "", 2.9, 3.9);
+    const std::vector<std::string> all = {"bond0", "eth0", "eth1"}, no_bond = {"eth0", "eth1"};
+    const struct {
+        const std::vector<std::string> &ifaces;
+        const char *holder;  // "": nobody answers
+        double min_s, max_s;
+    } cases[] = {
+        {all, "bond0", 0.0, 0.8}, {all, "eth0", 0.9, 1.9}, {all, "eth1", 1.9, 2.9},
+        {no_bond, "eth0", 0.0, 0.8}, {no_bond, "eth1", 0.9, 1.9}, {all, "", 2.9, 3.9},
+    };
+    for (const auto &c : cases) {
+        const int rc = korv_test::run_in_child([&] { return scope_case(c.ifaces, c.holder, c.min_s, c.max_s); });
+        if (rc == kSkip)
+            GTEST_SKIP() << "no private network namespace with test interfaces here (reason above)";
+        EXPECT_EQ(rc, 0) << c.ifaces.size() << " interfaces, holder " << c.holder << " (details above)";
+    }
 }

@@ -38,7 +38,6 @@ TEST(PlatformDb, IntegersAndStrings)
     EXPECT_EQ(dbDelete("/system_mgr/iscsi/iSNS"), 0);
     EXPECT_EQ(dbGetStr(buf, sizeof buf, "/system_mgr/iscsi/iSNS/ip"), 0);
     EXPECT_STREQ(buf, "");
-    EXPECT_EQ(dbGetLL("/system_mgr/iscsi/enable"), 1);
 
     db.stop();
     EXPECT_EQ(dbGetStr(buf, sizeof buf, "/system_mgr/iscsi/enable"), -1);

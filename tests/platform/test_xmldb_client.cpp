@@ -105,7 +105,7 @@ TEST(XmldbSave, WritesIntoTheConfigDirectoryOnlyAndReloads)
     EXPECT_EQ(get("/iscsi/target/id:7/name"), "seven");
 }
 
-TEST(XmldbAvailability, MissingServiceFailsQuicklyAndRestartIsPickedUp)
+TEST(XmldbAvailability, MissingOrStalledServiceFailsInBoundedTimeAndRestartIsPickedUp)
 {
     XmldbService db;
     ASSERT_EQ(xmldbc_set(S, 0, "/k", "v"), 0);  // leaves a cached connection behind
@@ -127,14 +127,10 @@ TEST(XmldbAvailability, MissingServiceFailsQuicklyAndRestartIsPickedUp)
     // A restart between two calls, with the connection still cached.
     db.restart();
     EXPECT_EQ(get("/k"), "");
-}
 
-TEST(XmldbAvailability, StalledServiceTimesOutAndLongSocketPathsAreRefused)
-{
-    XmldbService db;
-    ASSERT_EQ(xmldbc_set(S, 0, "/k", "v"), 0);
+    // A stalled service times out; the next call after it resumes works.
     ::kill(db.config().pid(), SIGSTOP);
-    auto t0 = std::chrono::steady_clock::now();
+    t0 = std::chrono::steady_clock::now();
     EXPECT_EQ(xmldbc_set(S, 0, "/k", "w"), -1);
     auto took = std::chrono::steady_clock::now() - t0;
     EXPECT_GE(took, std::chrono::milliseconds(1500));

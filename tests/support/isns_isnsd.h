@@ -40,15 +40,10 @@ public:
     void stop();
     // stop() then start(): an empty database.
     bool restart() { stop(); return start(); }
-    bool running() const { return pid_ > 0; }
-
-    const std::string &address() const { return address_; }
-    const std::string &dir() const { return dir_; }
     const std::string &error() const { return error_; }
 
-    // Runs "isnsadm -c <conf> --local <args>"; output (stdout and stderr)
-    // returned, exit status in *status when given.
-    std::string adm(const std::string &args, int *status = nullptr) const;
+    // Runs "isnsadm -c <conf> --local <args>"; returns stdout and stderr.
+    std::string adm(const std::string &args) const;
 
 private:
     std::string address_;

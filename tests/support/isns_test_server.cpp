@@ -9,7 +9,7 @@
 
 #include <algorithm>
 #include <cerrno>
-#include <chrono>
+#include <cstdlib>
 #include <cstring>
 
 namespace korv_test {
@@ -35,10 +35,10 @@ socklen_t make_addr(const std::string &address, int port, sockaddr_storage *ss)
     return 0;
 }
 
-void put32(bytes &b, uint32_t v)
+bytes be32(uint32_t v)
 {
-    for (int s = 24; s >= 0; s -= 8)
-        b.push_back(static_cast<uint8_t>(v >> s));
+    return {static_cast<uint8_t>(v >> 24), static_cast<uint8_t>(v >> 16), static_cast<uint8_t>(v >> 8),
+            static_cast<uint8_t>(v)};
 }
 
 }  // namespace
@@ -62,12 +62,9 @@ isns_fake_server::isns_fake_server(const std::string &address, int port)
             close(fd);
         return;
     }
-    if (pipe2(stop_pipe_, O_CLOEXEC) != 0) {
-        error_ = "pipe failed";
-        close(fd);
-        return;
-    }
     listen_fd_ = fd;
+    if (pipe2(stop_pipe_, O_CLOEXEC) != 0)
+        std::abort();  // out of descriptors: nothing a test can do
     thread_ = std::thread([this] { serve(); });
 }
 
@@ -81,11 +78,6 @@ isns_fake_server::~isns_fake_server()
     for (int fd : {listen_fd_, stop_pipe_[0], stop_pipe_[1]})
         if (fd >= 0)
             close(fd);
-}
-
-void isns_fake_server::set_reply(isns_fake_reply reply)
-{
-    set_handler([reply](const bytes &) { return reply; });
 }
 
 void isns_fake_server::set_handler(std::function<isns_fake_reply(const bytes &)> handler)
@@ -166,27 +158,18 @@ void isns_fake_server::serve_one(int fd)
 bytes isns_pdu(uint16_t func, uint16_t flags, const bytes &payload)
 {
     bytes b(12 + payload.size(), 0);
-    b[1] = 0x01;
-    b[2] = static_cast<uint8_t>(func >> 8);
-    b[3] = static_cast<uint8_t>(func);
-    b[4] = static_cast<uint8_t>(payload.size() >> 8);
-    b[5] = static_cast<uint8_t>(payload.size());
-    b[6] = static_cast<uint8_t>(flags >> 8);
-    b[7] = static_cast<uint8_t>(flags);
+    const uint16_t fields[] = {1, func, static_cast<uint16_t>(payload.size()), flags};
+    for (int i = 0; i < 4; i++) {
+        b[2 * i] = static_cast<uint8_t>(fields[i] >> 8);
+        b[2 * i + 1] = static_cast<uint8_t>(fields[i]);
+    }
     std::copy(payload.begin(), payload.end(), b.begin() + 12);
     return b;
 }
 
 bytes isns_attr_raw(uint32_t tag, const bytes &value)
 {
-    bytes b(8 + value.size(), 0);
-    const uint32_t len = static_cast<uint32_t>(value.size());
-    for (int i = 0; i < 4; i++) {
-        b[i] = static_cast<uint8_t>(tag >> (24 - 8 * i));
-        b[4 + i] = static_cast<uint8_t>(len >> (24 - 8 * i));
-    }
-    std::copy(value.begin(), value.end(), b.begin() + 8);
-    return b;
+    return be32(tag) + be32(static_cast<uint32_t>(value.size())) + value;
 }
 
 bytes isns_attr_str(uint32_t tag, const std::string &text)
@@ -200,16 +183,12 @@ bytes isns_attr_str(uint32_t tag, const std::string &text)
 
 bytes isns_attr_u32(uint32_t tag, uint32_t value)
 {
-    bytes v;
-    put32(v, value);
-    return isns_attr_raw(tag, v);
+    return isns_attr_raw(tag, be32(value));
 }
 
 bytes isns_query_rsp(uint32_t status, const std::string &key, const std::vector<std::string> &names)
 {
-    bytes b;
-    put32(b, status);
-    b = b + isns_attr_str(32, key) + isns_attr_raw(0, {});
+    bytes b = be32(status) + isns_attr_str(32, key) + isns_attr_raw(0, {});
     for (const std::string &n : names)
         b = b + isns_attr_str(32, n);
     return b;
@@ -227,13 +206,10 @@ bool tcp_port_open(const std::string &address, int port)
 {
     sockaddr_storage ss;
     const socklen_t len = make_addr(address, port, &ss);
-    if (!len)
-        return false;
-    int fd = socket(ss.ss_family, SOCK_STREAM | SOCK_CLOEXEC, 0);
-    if (fd < 0)
-        return false;
-    const bool open = connect(fd, reinterpret_cast<sockaddr *>(&ss), len) == 0;
-    close(fd);
+    const int fd = len ? socket(ss.ss_family, SOCK_STREAM | SOCK_CLOEXEC, 0) : -1;
+    const bool open = fd >= 0 && connect(fd, reinterpret_cast<sockaddr *>(&ss), len) == 0;
+    if (fd >= 0)
+        close(fd);
     return open;
 }
 

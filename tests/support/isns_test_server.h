@@ -43,7 +43,10 @@ public:
     const std::string &error() const { return error_; }
 
     // Every connection gets this reply (default: none, close at once).
-    void set_reply(isns_fake_reply reply);
+    void set_reply(isns_fake_reply reply)
+    {
+        set_handler([reply](const bytes &) { return reply; });
+    }
     // Or a reply computed from the request received (whole PDU bytes).
     void set_handler(std::function<isns_fake_reply(const bytes &request)> handler);
 

@@ -5,19 +5,17 @@
 #include "platform/xmldbc.h"
 
 #include <cerrno>
-#include <chrono>
 #include <csignal>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <fcntl.h>
+#include <filesystem>
 #include <fstream>
-#include <ftw.h>
+#include <iterator>
 #include <poll.h>
-#include <sstream>
 #include <stdexcept>
 #include <sys/prctl.h>
-#include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
 #include <vector>
@@ -31,33 +29,18 @@
 
 namespace korv_test {
 
+namespace fs = std::filesystem;
+
 namespace {
 
 pid_t g_root_owner = 0;
-
-int rm_entry(const char *p, const struct stat *, int, FTW *)
-{
-    ::remove(p);
-    return 0;
-}
-
-void rm_tree(const std::string &p)
-{
-    ::nftw(p.c_str(), rm_entry, 32, FTW_DEPTH | FTW_PHYS);
-}
+std::error_code ec_ignored;  // a test's files may already be gone
 
 void remove_root_at_exit()
 {
     // Forked children exit through here too: only the creator cleans up.
     if (::getpid() == g_root_owner)
-        rm_tree(SysRoot::path());
-}
-
-void mkdirs_real(const std::string &dir)
-{
-    for (size_t i = 1; i <= dir.size(); ++i)
-        if (i == dir.size() || dir[i] == '/')
-            ::mkdir(dir.substr(0, i).c_str(), 0755);
+        fs::remove_all(SysRoot::path(), ec_ignored);
 }
 
 }  // namespace
@@ -92,27 +75,25 @@ std::string SysRoot::file(const std::string &abs)
 
 void SysRoot::mkdirs(const std::string &abs)
 {
-    mkdirs_real(file(abs));
+    fs::create_directories(file(abs), ec_ignored);
 }
 
 void SysRoot::write(const std::string &abs, const std::string &content)
 {
-    std::string f = file(abs);
-    mkdirs_real(f.substr(0, f.rfind('/')));
+    const fs::path f = file(abs);
+    fs::create_directories(f.parent_path(), ec_ignored);
     std::ofstream(f, std::ios::binary | std::ios::trunc) << content;
 }
 
 std::string SysRoot::read(const std::string &abs)
 {
     std::ifstream in(file(abs), std::ios::binary);
-    std::ostringstream s;
-    s << in.rdbuf();
-    return s.str();
+    return {std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>()};
 }
 
 void SysRoot::remove(const std::string &abs)
 {
-    rm_tree(file(abs));
+    fs::remove_all(file(abs), ec_ignored);
 }
 
 std::string xmldbd_binary() { return KORV_XMLDBD_PATH; }
@@ -132,26 +113,17 @@ void XmldbProcess::start()
 {
     if (pid_ > 0)
         return;
-    std::vector<std::string> args = {xmldbd_binary(), "--socket", socket_, "--ready-fd", "3"};
-    if (!load_.empty()) {
-        args.push_back("--load");
-        args.push_back(load_);
-    }
-    std::vector<char *> argv;
-    for (auto &a : args)
-        argv.push_back(a.data());
+    std::string bin = xmldbd_binary(), load = load_;
+    std::vector<char *> argv = {bin.data(), const_cast<char *>("--socket"), socket_.data(),
+                                const_cast<char *>("--ready-fd"), const_cast<char *>("3")};
+    if (!load.empty())
+        argv.insert(argv.end(), {const_cast<char *>("--load"), load.data()});
     argv.push_back(nullptr);
 
     int p[2];
     if (::pipe2(p, O_CLOEXEC) != 0)
         throw std::runtime_error("pipe: " + std::string(std::strerror(errno)));
-    pid_t parent = ::getpid();
-    pid_t pid = ::fork();
-    if (pid < 0) {
-        ::close(p[0]);
-        ::close(p[1]);
-        throw std::runtime_error("fork: " + std::string(std::strerror(errno)));
-    }
+    const pid_t parent = ::getpid(), pid = ::fork();
     if (pid == 0) {
         // Never outlive the test that started us.
         ::prctl(PR_SET_PDEATHSIG, SIGKILL);
@@ -168,8 +140,7 @@ void XmldbProcess::start()
     pid_ = pid;
     pollfd pfd{p[0], POLLIN, 0};
     char c = 0;
-    int n = ::poll(&pfd, 1, 10000);
-    ssize_t got = n > 0 ? ::read(p[0], &c, 1) : -1;
+    const ssize_t got = ::poll(&pfd, 1, 10000) > 0 ? ::read(p[0], &c, 1) : -1;
     ::close(p[0]);
     if (got != 1) {
         kill();
@@ -177,14 +148,12 @@ void XmldbProcess::start()
     }
 }
 
-void XmldbProcess::kill(int sig)
+void XmldbProcess::kill()
 {
     if (pid_ <= 0)
         return;
-    ::kill(pid_, sig);
-    int st;
-    while (::waitpid(pid_, &st, 0) < 0 && errno == EINTR) {
-    }
+    ::kill(pid_, SIGKILL);
+    ::waitpid(pid_, nullptr, 0);
     pid_ = -1;
 }
 
@@ -193,39 +162,25 @@ int XmldbProcess::stop()
     if (pid_ <= 0)
         return -1;
     ::kill(pid_, SIGTERM);
-    auto until = std::chrono::steady_clock::now() + std::chrono::seconds(5);
     int st = 0;
-    for (;;) {
-        pid_t r = ::waitpid(pid_, &st, WNOHANG);
-        if (r == pid_ || (r < 0 && errno != EINTR)) {
-            pid_ = -1;
-            if (r < 0)
-                return -1;
-            return WIFEXITED(st) ? WEXITSTATUS(st) : 128 + WTERMSIG(st);
-        }
-        if (std::chrono::steady_clock::now() > until) {
-            kill(SIGKILL);  // a hung service must not hang the test
+    for (int i = 0; ::waitpid(pid_, &st, WNOHANG) == 0; ++i) {
+        if (i == 2500) {  // about 5 s: a hung service must not hang the test
+            kill();
             return 128 + SIGKILL;
         }
         ::usleep(2000);
     }
+    pid_ = -1;
+    return WIFEXITED(st) ? WEXITSTATUS(st) : 128 + WTERMSIG(st);
 }
 
 XmldbService::XmldbService(bool sysinfo, std::string load_file)
-    : with_sysinfo_(sysinfo),
-      config_(SysRoot::file(XMLDB_SOCK_ISCSI), std::move(load_file)),
+    : config_(SysRoot::file(XMLDB_SOCK_ISCSI), std::move(load_file)),
       sysinfo_(SysRoot::file(XMLDB_SOCK_SYSINFO))
 {
     config_.start();
-    if (with_sysinfo_)
+    if (sysinfo)
         sysinfo_.start();
-}
-
-XmldbProcess &XmldbService::sysinfo()
-{
-    if (!with_sysinfo_)
-        throw std::logic_error("XmldbService: sysinfo service not requested");
-    return sysinfo_;
 }
 
 void XmldbService::restart()

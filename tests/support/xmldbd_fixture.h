@@ -56,12 +56,9 @@ public:
     // status (128+N when killed by signal N, also after the 5 s grace
     // SIGKILL), or -1 when it was not running.
     int stop();
-    // Sends sig (default SIGKILL; it must end the process) and reaps the
-    // process; the socket stays behind.
-    void kill(int sig = 9);
-    bool running() const { return pid_ > 0; }
+    // SIGKILL and reap, as a crash would: the socket stays behind.
+    void kill();
     pid_t pid() const { return pid_; }
-    const std::string &socket() const { return socket_; }
 
 private:
     std::string socket_;
@@ -75,10 +72,8 @@ private:
 class XmldbService {
 public:
     explicit XmldbService(bool sysinfo = false, std::string load_file = {});
-    ~XmldbService() = default;
 
     XmldbProcess &config() { return config_; }
-    XmldbProcess &sysinfo();  // requires sysinfo
 
     // Stops (SIGTERM) / kills (SIGKILL) / restarts the configuration service.
     // A restart begins with an empty tree unless load_file was given.
@@ -87,7 +82,6 @@ public:
     void restart();
 
 private:
-    bool with_sysinfo_;
     XmldbProcess config_;
     XmldbProcess sysinfo_;
 };
