@@ -3,14 +3,12 @@
 // through the driver and stored in the database, and the daemon (the
 // installed binary) registers them. isnsadm must then show every target with
 // the portals the kernel reports, and nothing after SIGTERM.
-#include <arpa/inet.h>
 #include <signal.h>
 #include <unistd.h>
 
 #include <gtest/gtest.h>
 
 #include <chrono>
-#include <cstring>
 #include <memory>
 #include <set>
 #include <string>
@@ -29,6 +27,7 @@
 using namespace std::chrono_literals;
 using korv_test::daemon_process;
 using korv_test::eventually;
+using korv_test::isnsadm_rows;
 
 namespace {
 
@@ -94,25 +93,12 @@ void create_target(const std::string &name, int tpgt, const std::vector<Portal> 
     ASSERT_EQ(iscsi_mod_enable_target(t.get()), 0);
 }
 
-void delete_target(const std::string &name)
+void delete_target(const std::string &name, int tpgt)
 {
-    int tpgt = -1;
-    ASSERT_EQ(xmldb_get_target_tpgt(&tpgt, name.c_str()), 0);
     vm::Target t = with_portals(name, tpgt, {});
     ASSERT_TRUE(t);
     ASSERT_EQ(iscsi_mod_del_target(t.get()), 0);
     ASSERT_EQ(xmldb_del_target_by_name(name.c_str()), 0);
-}
-
-// isnsd prints IPv6 addresses in compressed form; the kernel's listing
-// carries the text of the portal directory.
-std::string compressed(const std::string &addr)
-{
-    unsigned char b[16];
-    char text[64];
-    if (inet_pton(AF_INET6, addr.c_str(), b) != 1 || !inet_ntop(AF_INET6, b, text, sizeof text))
-        return addr;
-    return text;
 }
 
 using Tagged = std::initializer_list<std::pair<const char *, int>>;
@@ -129,16 +115,11 @@ std::set<std::string> kernel_portal_groups(Tagged targets)
         for (iscsi_ip_t *ip : korv::list_records<iscsi_ip_t>(&ips))
             for (const char *addr : {ip->ipv4, ip->ipv6})
                 if (*addr)
-                    out.insert(iqn_of(name) + " " + compressed(addr) + " " + std::to_string(ip->port) + "/tcp " +
+                    out.insert(iqn_of(name) + " " + addr + " " + std::to_string(ip->port) + "/tcp " +
                                std::to_string(tpgt));
         iscsi_ip_free_list(&ips);
     }
     return out;
-}
-
-std::set<std::string> nodes(const korv_test::isnsd_server &srv)
-{
-    return korv_test::isnsadm_rows(srv, "nodes", {"iSCSI name"});
 }
 
 // Portal groups the server holds for the targets with their own tags. The
@@ -148,7 +129,7 @@ std::set<std::string> portal_groups(const korv_test::isnsd_server &srv, Tagged t
 {
     std::set<std::string> out;
     for (const std::string &pg :
-         korv_test::isnsadm_rows(srv, "portal-groups",
+         isnsadm_rows(srv, "portal-groups",
                                  {"Portal group name", "Portal group address", "Portal group port", "Portal group tag"}))
         for (auto [name, tag] : targets)
             if (pg.rfind(iqn_of(name) + " ", 0) == 0 && pg.substr(pg.rfind(' ') + 1) == std::to_string(tag))
@@ -159,15 +140,6 @@ std::set<std::string> portal_groups(const korv_test::isnsd_server &srv, Tagged t
 std::vector<Portal> shared_portals()
 {
     return {{"127.0.0.1", "::1", "", 3260}, {"", link_local(), "dummy0", 3260}};
-}
-
-// Adds (or, with an empty list, drops) portals of a target in the kernel
-// through the diffing update; the wanted list is the target's whole set.
-void set_portals(const std::string &name, int tpgt, const std::vector<Portal> &portals)
-{
-    vm::Target t = with_portals(name, tpgt, portals);
-    ASSERT_TRUE(t);
-    ASSERT_EQ(lio3_set_target_ip_v2(t.get()), 0);
 }
 
 class NesradInTheVm : public ::testing::Test {
@@ -212,7 +184,10 @@ protected:
             want_nodes.insert(iqn_of(n));
         const auto want_groups = kernel_portal_groups(portal_targets);
         EXPECT_TRUE(eventually(
-            [&] { return nodes(*srv_) == want_nodes && portal_groups(*srv_, portal_targets) == want_groups; },
+            [&] {
+                return isnsadm_rows(*srv_, "nodes", {"iSCSI name"}) == want_nodes &&
+                       portal_groups(*srv_, portal_targets) == want_groups;
+            },
             15s))
             << srv_->adm("--list nodes") << srv_->adm("--list portal-groups") << d.output();
     }
@@ -233,7 +208,7 @@ TEST_F(NesradInTheVm, RegistersWhatTheKernelReportsAndFollowsItsChanges)
 
     daemon_process d(korv_test::nesrad_binary(), kServer);
     expect_server_holds({"disk1", "disk2", "disk3"}, {{"disk1", 1}, {"disk2", 2}}, d);
-    EXPECT_EQ(korv_test::isnsadm_rows(*srv_, "entities", {"Entity identifier"}), std::set<std::string>{entity_id()});
+    EXPECT_EQ(isnsadm_rows(*srv_, "entities", {"Entity identifier"}), std::set<std::string>{entity_id()});
     EXPECT_EQ(portal_groups(*srv_, {{"disk3", 3}}), std::set<std::string>{}) << "disk3 has no portal";
     EXPECT_EQ(korv_test::stored_pid(), d.pid());
 
@@ -245,16 +220,20 @@ TEST_F(NesradInTheVm, RegistersWhatTheKernelReportsAndFollowsItsChanges)
     // server holds exactly the new state.
     std::vector<Portal> more = shared_portals();
     more.push_back({"127.0.0.9", "", "", 3269});
-    set_portals("disk1", 1, more);
-    set_portals("disk2", 2, more);
-    delete_target("disk4");
+    // The diffing update adds the new one; the wanted list is the whole set.
+    for (auto [name, tpgt] : {std::pair{"disk1", 1}, std::pair{"disk2", 2}}) {
+        vm::Target t = with_portals(name, tpgt, more);
+        ASSERT_TRUE(t);
+        ASSERT_EQ(lio3_set_target_ip_v2(t.get()), 0);
+    }
+    delete_target("disk4", 4);
     ASSERT_EQ(kernel_portal_groups({{"disk2", 2}}).count(disk2 + " 127.0.0.9 3269/tcp 2"), 1u);
     d.signal(SIGUSR2);
     expect_server_holds({"disk1", "disk2", "disk3"}, {{"disk1", 1}, {"disk2", 2}}, d);
 
     d.signal(SIGTERM);
     EXPECT_EQ(d.wait_exit(10s), 0) << d.output();
-    EXPECT_TRUE(nodes(*srv_).empty()) << srv_->adm("--list nodes");
+    EXPECT_TRUE(isnsadm_rows(*srv_, "nodes", {"iSCSI name"}).empty()) << srv_->adm("--list nodes");
     EXPECT_EQ(korv_test::stored_pid(), 0);
 }
 

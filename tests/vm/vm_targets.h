@@ -46,9 +46,6 @@ inline bool want_portal(iscsi_target_t *t, const std::string &ipv4, const std::s
     return true;
 }
 
-// Empties the target's wanted portals.
-inline void clear_portals(iscsi_target_t *t) { iscsi_ip_free_list(&t->ip_list); }
-
 // The automatic fe80:: address of an interface, from /proc/net/if_inet6;
 // "" when it has none.
 inline std::string link_local_of(const std::string &ifname)
