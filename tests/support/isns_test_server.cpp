@@ -1,6 +1,6 @@
 #include "tests/support/isns_test_server.h"
 
-#include <arpa/inet.h>
+#include <netdb.h>
 #include <fcntl.h>
 #include <netinet/in.h>
 #include <poll.h>
@@ -16,23 +16,18 @@ namespace korv_test {
 
 namespace {
 
-/* Fills a sockaddr for an IPv4 or IPv6 text; 0 on failure. */
+/* Fills a sockaddr for an IPv4 or IPv6 text (no name lookup); 0 on failure. */
 socklen_t make_addr(const std::string &address, int port, sockaddr_storage *ss)
 {
-    std::memset(ss, 0, sizeof *ss);
-    auto *in4 = reinterpret_cast<sockaddr_in *>(ss);
-    if (inet_pton(AF_INET, address.c_str(), &in4->sin_addr) == 1) {
-        in4->sin_family = AF_INET;
-        in4->sin_port = htons(static_cast<uint16_t>(port));
-        return sizeof(sockaddr_in);
-    }
-    auto *in6 = reinterpret_cast<sockaddr_in6 *>(ss);
-    if (inet_pton(AF_INET6, address.c_str(), &in6->sin6_addr) == 1) {
-        in6->sin6_family = AF_INET6;
-        in6->sin6_port = htons(static_cast<uint16_t>(port));
-        return sizeof(sockaddr_in6);
-    }
-    return 0;
+    addrinfo hints{}, *ai = nullptr;
+    hints.ai_flags = AI_NUMERICHOST | AI_NUMERICSERV;
+    hints.ai_socktype = SOCK_STREAM;
+    if (getaddrinfo(address.c_str(), std::to_string(port).c_str(), &hints, &ai) != 0)
+        return 0;
+    const socklen_t len = ai->ai_addrlen;
+    std::memcpy(ss, ai->ai_addr, len);
+    freeaddrinfo(ai);
+    return len;
 }
 
 bytes be32(uint32_t v)
