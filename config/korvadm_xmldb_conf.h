@@ -26,36 +26,8 @@ extern "C" {
 /* The store's operations table; slots of later work are NULL. */
 extern const iscsi_conf_ops_t iscsi_conf_ops;
 
-/* ---- scanner and counters (shared by the schema's units) ---- */
-
-/* Entry number whose <key> equals value, scanning 1..max until the first
- * empty or unreadable key. ID_ENTRY_FOUND (5) with *out_id = N, or
- * ID_ENTRY_NOT_FOUND (6) with *out_id = 0; -9989 for a NULL argument. */
-int _search_xmldb_id_entry(int *out_id, const char *root, int max, const char *key, const char *value);
-/* First number 1..max whose key is empty or unreadable: 5 with *out_id = N;
- * 6 with *out_id = 0 when all max are taken; -9989 for a NULL argument. */
-int _get_free_xmldb_id_entry(int *out_id, const char *root, int max, const char *key);
-/* Number of consecutive entries from 1 (at most max) holding a key; -1 for a
- * NULL argument. */
-int _cal_xmldb_id_entry_count(const char *root, int max, const char *key);
-
-/* Counter updates: read (failed or empty reads as 0), adjust (never below 0),
- * write back. 0, or -9981 when the write fails. */
-int _xmldb_inc_target_count(void);
-int _xmldb_dec_target_count(void);
-int _xmldb_inc_lun_count(void);
-int _xmldb_dec_lun_count(void);
-int _xmldb_inc_acl_count(void);
-int _xmldb_dec_acl_count(void);
-int _xmldb_inc_target_lun_map_cnt(int target_id);
-int _xmldb_dec_target_lun_map_cnt(int target_id);
 /* Recounts the ACL initiators (1..129) into "/iscsi/acl/count". 0 / -9981. */
-int _xmldb_update_current_aclcnt(void);
 int xmldb_update_current_aclcnt(void);
-
-/* Entry number of the named target (>= 1); -9980 when it is not found,
- * -9989 for NULL, -9981 on a scan failure. */
-int _xmldb_get_target_dbidx_by_name(const char *name);
 
 /* ---- targets: at most 64 under "/iscsi/target", keyed by "name" ---- */
 

@@ -8,6 +8,7 @@
 #include "common/korvadm_log.h"
 #include "config/korvadm_conf.h"
 #include "config/korvadm_xmldb_conf.h"
+#include "config/korvadm_xmldb_conf_internal.h"
 #include "tests/config/store_fixture.h"
 #include "tests/support/capture.h"
 
