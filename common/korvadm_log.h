@@ -7,7 +7,9 @@
  * newline, when the debug level is at least `level`. Standard output is
  * flushed after the prefix (even when nothing printed) and after the message,
  * so the lines stay in order with the output of shell commands we run.
- * `unit` is the source file's name without directory or extension.
+ * `unit` is the source file's name without directory or extension, or
+ * KORV_LOG_UNIT where a unit split into several files defines it (in its
+ * _internal.h, with #undef first), so every file logs under the unit's name.
  * Level 0 is errors, 1 details, 2 progress, 3 and 4 traces. A negative debug
  * level silences everything. */
 #ifndef KORVADM_LOG_H
@@ -27,10 +29,14 @@ void korv_log(int level, const char *file, const char *func, int line, const cha
 }
 #endif
 
-#define DBG(level, ...) korv_log((level), __FILE__, __func__, __LINE__, __VA_ARGS__)
+#ifndef KORV_LOG_UNIT
+#define KORV_LOG_UNIT __FILE__
+#endif
+
+#define DBG(level, ...) korv_log((level), KORV_LOG_UNIT, __func__, __LINE__, __VA_ARGS__)
 
 /* For a helper shared by several operations: the line names `func`, the
  * operation it works for, which is the name an operator knows. */
-#define DBG_AS(func, level, ...) korv_log((level), __FILE__, (func), __LINE__, __VA_ARGS__)
+#define DBG_AS(func, level, ...) korv_log((level), KORV_LOG_UNIT, (func), __LINE__, __VA_ARGS__)
 
 #endif

@@ -70,17 +70,6 @@ int configfs_write_attr_int(const char *path, int value, int verify);
 
 /* ---- kernel modules ---- */
 
-/* "insmod <mod_path>". -9989 NULL; -9988 when the command fails. */
-int _insert_mod(const char *mod_path);
-/* "rmmod <name>"; with check_inserted 1 an absent module answers 0 at once.
- * -9989 NULL; -9988 when the command fails. */
-int _remove_mod(const char *mod_proc_name, int check_inserted);
-/* Last resort: rm -rf the iscsi and core trees, rmmod all three modules.
- * -9988 when the last rmmod fails. No operation calls it. */
-int _brute_force_remove_mod(void);
-/* Runs cmd up to max_retry+1 times (see process_system_cmd_mt). */
-int _process_system_cmd_mt(const char *cmd, int max_retry, int max_sleep_us);
-
 /* Slot 0: mounts configfs if needed, inserts the modules, creates the iSCSI
  * fabric directory and /var/target/{pr,alua}. Judged by /proc/modules; on a
  * failure from target_core_file onwards all three modules are removed and
@@ -122,38 +111,11 @@ int lio3_set_target_attr_dataout_timeout(int timeout, iscsi_target_t *target);
  * do not parse are dropped. -9973 when the np directory cannot be read. */
 int lio3_get_target_existing_ip_list(list_t *ip_list, iscsi_target_t *target);
 
-/* 1 when the CHAP settings are usable: CHAP off, or name and a 12..16
- * character password (and the same for mutual CHAP when it is on); else 0. */
-int _lio3_validate_target_chap_settings(const iscsi_target_t *target);
-/* Pushes the target's CHAP (and mutual CHAP) credentials to one ACL. */
-int _lio3_set_target_chap_to_acl(const char *initiator_iqn, iscsi_target_t *target);
-
-/* IP_TYPE_V4 when name holds fewer than two ':', else IP_TYPE_V6. */
-int _check_np_ip_type(const char *name);
-/* Splits a portal directory name ("a.b.c.d:port", "[v6]:port",
- * "[v6%if]:port") into its parts. The port text must be under 6 characters;
- * address and interface must fit addr_size / if_size. -9989 on a malformed
- * name, -9971 on "". iface is "" when the name has no '%'. */
-int _parse_lio_np_entry(char *addr, size_t addr_size, int *port, char *iface, size_t if_size,
-                        const char *name);
-
-/* ---- teardown (used by deletion and stop) ---- */
+/* ---- backstores (slots 11..14) ---- */
 
 /* Slot 13: removes the LUN's fileio backstore (and its ALUA state). An
  * absent one answers 0; -9989 on bad LUN fields or failure. */
 int lio3_shutdown_backstore(iscsi_lun_t *lun);
-int _lio3_remove_fileio_device(iscsi_lun_t *lun);
-/* Remove every ACL / LUN directory of the portal group; -9989 when the
- * group's acls/ or lun/ directory cannot be opened. */
-int _lio3_remove_all_acl(iscsi_target_t *target);
-int _lio3_remove_all_lun(iscsi_target_t *target);
-/* Deletes every portal group (tpgt_<n>) of target->iqn. -9973 when one could
- * not be deleted and the IQN directory remains. */
-int _lio3_remove_all_tpgt(iscsi_target_t *target);
-/* Deletes every target of the iSCSI fabric. -9973 on the first failure. */
-int _lio3_remove_all_iscsi_target(void);
-/* Shuts down every fileio backstore and removes every HBA directory. */
-int _lio3_shutdown_all_hba(void);
 
 #ifdef __cplusplus
 }

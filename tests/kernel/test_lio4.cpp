@@ -1,7 +1,7 @@
 // The LIO back end on the host: attribute I/O on plain files, shell escaping,
 // module start/stop decisions with stand-in commands, CHAP checks, portal
 // names and portal lists. How configfs itself reacts is the VM suite's part.
-#include "kernel/korvadm_mod_lio4.h"
+#include "kernel/korvadm_mod_lio4_internal.h"
 
 #include <fcntl.h>
 #include <unistd.h>

@@ -1,0 +1,252 @@
+// Network portals: directory names, creation and removal, the kernel's
+// portal list, and the replace-all and diffing setters.
+#include "kernel/korvadm_mod_lio4_internal.h"
+
+#include <cstdlib>
+#include <cstring>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "common/korvadm_err.h"
+#include "common/korvadm_list.h"
+#include "common/korvadm_utils.h"
+
+using namespace lio4;
+
+namespace {
+
+std::string np_name(const char *address, const char *interface, int port, int type)
+{
+    if (type != IP_TYPE_V4 && type != IP_TYPE_V6)
+        type = _check_np_ip_type(address);
+    if (type == IP_TYPE_V4)
+        return std::string(address) + ":" + std::to_string(port);
+    // An address that does not parse is scoped too: the kernel then refuses
+    // it rather than binding an unintended address.
+    if (is_ipv6_link_local(address) != 0)
+        return "[" + std::string(address) + "%" + (interface ? interface : "") + "]:" + std::to_string(port);
+    return "[" + std::string(address) + "]:" + std::to_string(port);
+}
+
+// The np directory of a portal; false when the arguments cannot name one.
+bool np_path(const char *iqn, int tpgt, const char *interface, const char *address, int port, int type,
+             std::string &path)
+{
+    if (!iqn || !address || !*address || std::strchr(address, '/') || !tpgt_ok(tpgt))
+        return false;
+    path = tpg_dir(iqn, tpgt) + "/np/" + np_name(address, interface, port, type);
+    return true;
+}
+
+}  // namespace
+
+int _lio3_create_network_portal(const char *iqn, int tpgt, const char *interface, const char *address,
+                                int port, int type)
+{
+    std::string path;
+    if (!np_path(iqn, tpgt, interface, address, port, type, path))
+        return ERR_PARAM;
+    return make_dir(path.c_str(), 0700) == 0 ? KORV_OK : ERR_CONFIGFS;
+}
+
+int _lio3_remove_network_portal(const char *iqn, int tpgt, const char *interface, const char *address,
+                                int port, int type)
+{
+    std::string path;
+    if (!np_path(iqn, tpgt, interface, address, port, type, path))
+        return ERR_PARAM;
+    return configfs_rmdir(path.c_str()) == 0 ? KORV_OK : ERR_CONFIGFS;
+}
+
+namespace {
+
+const char *ip_address(const iscsi_ip_t *ip, int type)
+{
+    return type == IP_TYPE_V4 ? ip->ipv4 : ip->ipv6;
+}
+
+const char *ip_type_name(int type)
+{
+    return type == IP_TYPE_V4 ? "IP_TYPE_V4" : "IP_TYPE_V6";
+}
+
+bool list_has_address(list_t *list, const iscsi_ip_t *ip, int type)
+{
+    return type == IP_TYPE_V4 ? iscsi_ip_search_list_by_IPv4(list, ip->ipv4) != nullptr
+                              : iscsi_ip_search_list_by_IPv6(list, ip->ipv6) != nullptr;
+}
+
+// Creates the wanted portals of target, every IPv4 one first, leaving out
+// addresses `existing` already holds when it is given. Failures are logged.
+void create_portals(const char *func, iscsi_target_t *target, list_t *existing)
+{
+    for (int type : {IP_TYPE_V4, IP_TYPE_V6}) {
+        for (iscsi_ip_t *ip : korv::list_records<iscsi_ip_t>(&target->ip_list)) {
+            const char *address = ip_address(ip, type);
+            if (!address[0] || (existing && list_has_address(existing, ip, type)))
+                continue;
+            if (_lio3_create_network_portal(target->iqn, target->tpgt, ip->dev_name, address, ip->port, type) != 0)
+                DBG_AS(func, 0, "_lio3_create_network_portal( %s , %d , %s , %s , %d, %s ) return error", target->iqn,
+                    target->tpgt, ip->dev_name, address, ip->port, ip_type_name(type));
+        }
+    }
+}
+
+// The kernel's portals of target, appended to list in directory order only
+// when all of them could be read.
+}  // namespace
+
+int _get_exist_ip_list(const iscsi_target_t *target, list_t *list)
+{
+    std::string np = tpg_dir(target->iqn, target->tpgt) + "/np";
+    std::vector<std::string> names;
+    if (!list_subdirs(np, names)) {
+        DBG(0, "can not open directory : %s", np.c_str());
+        return ERR_PARAM;
+    }
+    ip_list_guard found;
+    for (const std::string &name : names) {
+        DBG(2, "get one existing np : %s", name.c_str());
+        iscsi_ip_t *ip = iscsi_ip_new();
+        if (!ip) {
+            DBG(0, "malloc iscsi_ip_t failed");
+            return ERR_CONFIGFS;
+        }
+        int port = 0;
+        int rc;
+        if (_check_np_ip_type(name.c_str()) == IP_TYPE_V4)
+            rc = _parse_lio_np_entry(ip->ipv4, sizeof ip->ipv4, &port, ip->dev_name, sizeof ip->dev_name,
+                                     name.c_str());
+        else
+            rc = _parse_lio_np_entry(ip->ipv6, sizeof ip->ipv6, &port, ip->dev_name, sizeof ip->dev_name,
+                                     name.c_str());
+        if (rc != 0) {
+            DBG(0, "parse %s failed", name.c_str());
+            iscsi_ip_free(ip);
+            continue;
+        }
+        ip->port = port;
+        list_append(&ip->node, &found.list);
+    }
+    while (found.list.head) {
+        list_node_t *node = found.list.head;
+        list_remove(node);
+        list_append(node, list);
+    }
+    return KORV_OK;
+}
+
+int _lio3_remove_all_np(const iscsi_target_t *target)
+{
+    std::string np = tpg_dir(target->iqn, target->tpgt) + "/np";
+    std::vector<std::string> names;
+    if (!list_subdirs(np, names)) {
+        DBG(0, "can not open directory : %s", np.c_str());
+        return ERR_PARAM;
+    }
+    for (const std::string &name : names) {
+        std::string path = np + "/" + name;
+        if (remove_dir(path.c_str()) != 0) {
+            DBG(0, "can not remove network portal : %s", path.c_str());
+            return ERR_CONFIGFS;
+        }
+    }
+    return KORV_OK;
+}
+
+int lio3_set_target_ip(iscsi_target_t *target)
+{
+    CHECK_TARGET(target, "target is NULL", "target IQN is empty", "target TPGT out of limitation");
+    if (_lio3_remove_all_np(target) != 0)
+        DBG(0, "_lio3_remove_all_np error");
+    create_portals(__func__, target, nullptr);
+    return KORV_OK;
+}
+
+int lio3_set_target_ip_v2(iscsi_target_t *target)
+{
+    CHECK_TARGET(target, "target is NULL", "target IQN is empty", "target TPGT out of limitation");
+    ip_list_guard existing;
+    if (_get_exist_ip_list(target, &existing.list) != 0)
+        DBG(0, "_get_exist_ip_list error");
+    create_portals(__func__, target, &existing.list);
+    for (iscsi_ip_t *ip : korv::list_records<iscsi_ip_t>(&existing.list)) {
+        for (int type : {IP_TYPE_V4, IP_TYPE_V6}) {
+            const char *address = ip_address(ip, type);
+            if (!address[0] || list_has_address(&target->ip_list, ip, type))
+                continue;
+            if (_lio3_remove_network_portal(target->iqn, target->tpgt, ip->dev_name, address, ip->port, type) != 0)
+                DBG(0, "_lio3_remove_network_portal( %s , %d , %s , %s , %d , %s) return error", target->iqn,
+                    target->tpgt, ip->dev_name, address, ip->port, ip_type_name(type));
+        }
+    }
+    return KORV_OK;
+}
+
+int lio3_get_target_existing_ip_list(list_t *ip_list, iscsi_target_t *target)
+{
+    if (!ip_list || !target) {
+        DBG(0, "ip_list or target is NULL");
+        return ERR_PARAM;
+    }
+    CHECK_TARGET(target, "target is NULL", "target IQN is empty", "target TPGT out of limitation");
+    if (_get_exist_ip_list(target, ip_list) != 0) {
+        DBG(0, "_get_exist_ip_list error");
+        return ERR_CONFIGFS;
+    }
+    return KORV_OK;
+}
+
+/* ================================================================ np names */
+
+int _check_np_ip_type(const char *name)
+{
+    int colons = 0;
+    for (const char *p = name; p && *p; ++p)
+        colons += *p == ':';
+    return colons < 2 ? IP_TYPE_V4 : IP_TYPE_V6;
+}
+
+int _parse_lio_np_entry(char *addr, size_t addr_size, int *port, char *iface, size_t if_size, const char *name)
+{
+    if (!addr || !port || !iface || !name || addr_size == 0 || if_size == 0) {
+        DBG(0, "parameter error");
+        return ERR_PARAM;
+    }
+    if (!*name) {
+        DBG(0, "np_ent_name is empty");
+        return ERR_ATTR_EMPTY;
+    }
+    std::string_view rest(name);
+    if (rest.front() == '[')
+        rest.remove_prefix(1);
+    size_t colon = rest.rfind(':');
+    if (colon == std::string_view::npos) {
+        DBG(0, "can not find port number in %s", name);
+        return ERR_PARAM;
+    }
+    std::string_view address = rest.substr(0, colon);
+    if (!address.empty() && address.back() == ']')
+        address.remove_suffix(1);
+    std::string_view port_text = rest.substr(colon + 1);
+    if (port_text.size() >= 6) {
+        DBG(0, "can not find port number in %s", name);
+        return ERR_PARAM;
+    }
+    std::string_view scope;
+    if (size_t pct = address.rfind('%'); pct != std::string_view::npos) {
+        scope = address.substr(pct + 1);
+        address = address.substr(0, pct);
+    }
+    if (address.size() >= addr_size || scope.size() >= if_size) {
+        DBG(0, "address or interface of %s too long", name);
+        return ERR_PARAM;
+    }
+    address.copy(addr, address.size());
+    addr[address.size()] = '\0';
+    scope.copy(iface, scope.size());
+    iface[scope.size()] = '\0';
+    *port = std::atoi(std::string(port_text).c_str());
+    return KORV_OK;
+}
