@@ -118,8 +118,12 @@ int xmldb_delete_node(const char *path)
 
 int xmldb_write_config_file(void)
 {
+    // A file that was not written must not replace the good copy on flash.
+    if (xml_write_file(KORV_CONFIG_FILE) != 0) {
+        DBG(0, "xml_write_file(%s) failed", KORV_CONFIG_FILE);
+        return ERR_DB_WRITE;
+    }
     // The flash copy is what survives a reboot; its result is the one that matters.
-    xml_write_file(KORV_CONFIG_FILE);
     return LIB_CP_Config_To_MTD(1);
 }
 

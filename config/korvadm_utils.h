@@ -41,7 +41,8 @@ int xmldb_set_cstring(const char *value, const char *path);
  * logged at level 2 only because callers routinely delete absent subtrees. */
 int xmldb_delete_node(const char *path);
 /* Saves the database to KORV_CONFIG_FILE and copies it to flash; returns the
- * copy's result. */
+ * copy's result. When the file cannot be written: -9981, and nothing is
+ * copied. */
 int xmldb_write_config_file(void);
 
 /* Newly allocated copy of at most max_len bytes of src, always terminated.

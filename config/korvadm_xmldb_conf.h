@@ -31,8 +31,9 @@ int xmldb_update_current_aclcnt(void);
 
 /* ---- targets: at most 64 under "/iscsi/target", keyed by "name" ---- */
 
-/* Validates conf (name, iqn, tpgt >= 0, chap_enable 0/1, hba_id >= 0, CHAP
- * name and secret when CHAP is on; -9989 before any write), takes the free
+/* Validates conf (name shorter than CONF_NAME_LEN, iqn, tpgt >= 0,
+ * chap_enable 0/1, hba_id >= 0, CHAP name and secret when CHAP is on; -9989
+ * before any write), takes the free
  * entry (-9979 when 64 exist), sets conf->dbidx, writes the fields and bumps
  * the count. A failed write gives -9981 and leaves what was written. */
 int xmldb_add_new_target(target_conf_t *conf);
@@ -55,9 +56,8 @@ int xmldb_set_target_iqn(const char *iqn, const char *name);
 /* chap_enable 0 clears the name and secret; anything but 0/1 is -9989. */
 int xmldb_set_target_chap(int chap_enable, const char *chap_name, const char *chap_pwd, const char *name);
 /* Recounts targets and running targets over 1..64 (gaps included), then
- * deletes entry count + 1 when it holds a status (a ghost of an interrupted
- * delete). The name there is not checked: after a delete that left a gap, a
- * real target at count + 1 is removed too, so rewrite the list first. */
+ * deletes entry count + 1 when it holds a status but no name (a ghost of an
+ * interrupted delete); an entry with a name is never deleted. */
 int xmldb_update_current_targetcnt(void);
 /* size must be at least CONF_NAME_LEN. */
 int xmldb_get_target_status(char *buf, size_t size, const char *name);
@@ -65,9 +65,10 @@ int xmldb_set_target_status(const char *status, const char *name);
 /* Fills conf (a record from target_conf_new) with every field of the target. */
 int xmldb_get_target_conf_by_name(target_conf_t *conf, const char *name);
 /* Appends one record per target (1..64, up to the first empty name) with name
- * and tpgt only. Fails as a whole (records appended by this call are freed)
- * with -9992 when the database cannot be read, -9990 for an unreadable tpgt,
- * -9987 with no memory. */
+ * and tpgt only. A record that cannot be filled (an unreadable tpgt, a name
+ * too long for the record) is skipped with a logged error. Fails as a whole,
+ * appending nothing, only with -9992 when the service does not answer (the
+ * caller may retry) or -9987 with no memory. */
 int xmldb_get_all_target_conf_lite(list_t *list);
 /* As the lite form, every field filled; CHAP name and secret only when CHAP is on. */
 int xmldb_get_all_target_conf(list_t *list);

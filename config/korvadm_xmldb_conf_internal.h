@@ -6,7 +6,9 @@
 #include <cstdarg>
 #include <cstddef>
 #include <cstdio>
+#include <cstring>
 
+#include "common/korvadm_err.h"
 #include "common/korvadm_log.h"
 #include "config/korvadm_xmldb_conf.h"
 
@@ -80,9 +82,96 @@ const char *target_path(char (&buf)[N], int id, const char *field)
     return entry_path(buf, kTargetRoot, id, field);
 }
 
+// Room for a key as read: larger than any record's key field, so a stored
+// key too long for its field is seen as such rather than cut to fit.
+constexpr size_t kKeyLen = 512;
+
 // Reads entry N's key: true with a non-empty value; false when empty or
 // unreadable. *rc_out, when given, receives the read's own result.
-bool read_key(const char *root, int id, const char *key, char (&value)[kPathLen], int *rc_out = nullptr);
+bool read_key(const char *root, int id, const char *key, char (&value)[kKeyLen], int *rc_out = nullptr);
+
+// Deletes entry n of a list when it is a ghost, what an interrupted delete
+// leaves: a status without a name. An entry with a name is never touched,
+// whatever its status (after a delete left a gap, count + 1 is a real entry).
+// 0, or -9981 when the delete fails.
+int remove_ghost(const char *func, const char *root, int n);
+
+// True when text (NUL-terminated within max bytes or not) fits a field of N
+// bytes with its terminator.
+template <size_t N>
+bool fits(const char *text)
+{
+    return strnlen(text, N) < N;
+}
+
+// Copies text into a record field, cut to it.
+template <size_t N>
+void copy_cut(char (&field)[N], const char *text)
+{
+    size_t len = strnlen(text, N - 1);
+    std::memcpy(field, text, len);
+    field[len] = '\0';
+}
+
+// A failure of the service itself (or of memory) fails a whole list read;
+// any other failure only costs the record that could not be filled.
+inline bool whole_read_failure(int rc)
+{
+    return rc == ERR_DB_CLIENT || rc == ERR_NO_MEMORY || rc == ERR_PARAM;
+}
+
+// Walks entries 1..max of a list up to the first empty key, calling
+// fill(n, key) for each; fill answers 0 or a code. A key too long for a
+// field of key_field bytes is a broken record and skipped, never cut (a cut
+// key could name another record); so is a record fill() cannot fill, logged
+// with skip_fmt (one %s: the key) when given. Returns 0, or the first whole
+// failure.
+template <class Fill>
+int walk_list(const char *func, const char *root, int max, const char *key, size_t key_field,
+              const char *skip_fmt, Fill fill)
+{
+    for (int n = 1; n <= max; n++) {
+        char value[kKeyLen];
+        int rc = KORV_OK;
+        if (!read_key(root, n, key, value, &rc)) {
+            if (rc != KORV_OK) {
+                char path[kPathLen];
+                DBG_AS(func, 0, "xmldbc_get(%s) failed", entry_path(path, root, n, key));
+            }
+            return rc;
+        }
+        if (strnlen(value, key_field) >= key_field) {
+            DBG_AS(func, 0, "%s/id:%d/%s is too long for the record, skipped", root, n, key);
+            continue;
+        }
+        rc = fill(n, value);
+        if (whole_read_failure(rc))
+            return rc;
+        if (rc != KORV_OK && skip_fmt)
+            DBG_AS(func, 0, skip_fmt, value);
+    }
+    return KORV_OK;
+}
+
+// Runs read(&got) on a private list and hands its records to out only on
+// success, so a failed read never leaves half a set with the caller.
+template <class Read>
+int read_into(list_t *out, void (*free_list)(list_t *), Read read)
+{
+    list_t got;
+    list_init(&got);
+    int rc = read(&got);
+    if (rc != KORV_OK) {
+        free_list(&got);
+        return rc;
+    }
+    while (!list_is_empty(&got)) {
+        list_node_t *node = got.head;
+        list_remove(node);
+        list_append(node, out);
+    }
+    return KORV_OK;
+}
 
 // Entry number of a target for the single-field operations: >= 1, or the
 // operation's result code, logged under the operation's name.

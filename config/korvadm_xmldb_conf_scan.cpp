@@ -9,7 +9,7 @@
 
 using namespace xmldb_conf;
 
-bool xmldb_conf::read_key(const char *root, int id, const char *key, char (&value)[kPathLen], int *rc_out)
+bool xmldb_conf::read_key(const char *root, int id, const char *key, char (&value)[kKeyLen], int *rc_out)
 {
     char path[kPathLen];
     entry_path(path, root, id, key);
@@ -25,10 +25,11 @@ int _search_xmldb_id_entry(int *out_id, const char *root, int max, const char *k
     PARAM_ERROR_IF(!out_id || !root || !key || !value);
     *out_id = 0;
     for (int n = 1; n <= max; n++) {
-        char got[kPathLen];
+        char got[kKeyLen];
         if (!read_key(root, n, key, got))
             return ID_ENTRY_NOT_FOUND;
-        if (std::strcmp(got, value) == 0) {
+        // A key that filled the buffer may have been cut: never a match.
+        if (strnlen(got, sizeof got) < sizeof got - 1 && std::strcmp(got, value) == 0) {
             *out_id = n;
             return ID_ENTRY_FOUND;
         }
@@ -66,7 +67,7 @@ int _cal_xmldb_id_entry_count(const char *root, int max, const char *key)
         return -1;
     }
     int count = 0;
-    char got[kPathLen];
+    char got[kKeyLen];
     while (count < max && read_key(root, count + 1, key, got))
         count++;
     return count;
@@ -128,4 +129,22 @@ int _xmldb_update_current_aclcnt(void)
 int xmldb_update_current_aclcnt(void)
 {
     return _xmldb_update_current_aclcnt();
+}
+
+int xmldb_conf::remove_ghost(const char *func, const char *root, int n)
+{
+    char path[kPathLen];
+    char value[kKeyLen] = "";
+    if (xmldb_get_cstring(value, sizeof value, entry_path(path, root, n, "status")) != KORV_OK || !value[0])
+        return KORV_OK;
+    value[0] = '\0';
+    if (xmldb_get_cstring(value, sizeof value, entry_path(path, root, n, "name")) != KORV_OK || value[0])
+        return KORV_OK;
+    pathf(path, sizeof path, "%s/id:%d", root, n);
+    DBG_AS(func, 1, "discover and remove ghost entry at PATH: %s", path);
+    if (xmldb_delete_node(path) != KORV_OK) {
+        DBG_AS(func, 0, "xmldbc_delete(%s) failed", path);
+        return ERR_DB_WRITE;
+    }
+    return KORV_OK;
 }

@@ -133,7 +133,8 @@ int xmldb_add_new_target(target_conf_t *conf)
     PARAM_ERROR_IF(!conf);
     // Every check before the first write, so a refused record leaves no trace.
     const bool chap = conf->chap_enable == 1;
-    const char *invalid = !conf->name[0]                             ? "target_suffix error"
+    // A name that fills the record's field would be cut by every reader.
+    const char *invalid = !conf->name[0] || !fits<CONF_NAME_LEN>(conf->name) ? "target_suffix error"
                           : !conf->iqn[0]                            ? "IQN error"
                           : conf->tpgt < 0                           ? "TPGT error"
                           : conf->chap_enable != 0 && !chap          ? "enable_chap error"
@@ -354,20 +355,7 @@ int xmldb_update_current_targetcnt(void)
     }
     DBG(1, "total running entry=%d", running);
 
-    // A ghost is what an interrupted delete leaves: a status right after the
-    // last counted target. Only that one position is checked, and its name is
-    // not: in a list with a gap, the target at count + 1 goes too.
-    char path[kPathLen];
-    char status[kPathLen] = "";
-    if (xmldb_get_cstring(status, sizeof status, target_path(path, count + 1, "status")) == KORV_OK && status[0]) {
-        pathf(path, sizeof path, "%s/id:%d", kTargetRoot, count + 1);
-        DBG(1, "discover and remove ghost entry at PATH: %s", path);
-        if (xmldb_delete_node(path) != KORV_OK) {
-            DBG(0, "xmldbc_delete(%s) failed", path);
-            return ERR_DB_WRITE;
-        }
-    }
-    return KORV_OK;
+    return remove_ghost(__func__, kTargetRoot, count + 1);
 }
 
 int xmldb_get_target_status(char *buf, size_t size, const char *name)

@@ -1,6 +1,5 @@
 // Target records: filling one, reading them all.
 #include <cstdint>
-#include <cstdio>
 
 #include "common/korvadm_err.h"
 #include "config/korvadm_utils.h"
@@ -57,58 +56,43 @@ int fill_target_conf(const char *func, target_conf_t *conf, int n, bool full)
     return KORV_OK;
 }
 
-// Reads entries 1..64 up to the first empty name into a private list, handed
-// to the caller only when every entry read: a reader never sees half a set.
+// Reads entries 1..64 up to the first empty name. A record that cannot be
+// filled is skipped (the fill logged why); only a failure of the service
+// fails the whole read, so the caller can tell an outage from bad data.
 int read_all_targets(const char *func, list_t *out, bool full)
 {
     if (!out) {
         DBG_AS(func, 0, "parameter error");
         return ERR_PARAM;
     }
-    list_t got;
-    list_init(&got);
-    int rc = KORV_OK;
-    for (int n = 1; n <= CONF_MAX_TARGETS; n++) {
-        char name[kPathLen];
-        int read_rc = KORV_OK;
-        if (!read_key(kTargetRoot, n, "name", name, &read_rc)) {
-            if (read_rc != KORV_OK) {
-                char path[kPathLen];
-                DBG_AS(func, 0, "xmldbc_get(%s) failed", target_path(path, n, "name"));
-                rc = read_rc;
-            }
-            break;
-        }
-        target_conf_t *conf = target_conf_new();
-        if (!conf) {
-            DBG_AS(func, 0, "new t_conf failed error");
-            rc = ERR_NO_MEMORY;
-            break;
-        }
-        list_append(&conf->node, &got);
-        std::snprintf(conf->name, sizeof conf->name, "%.*s", static_cast<int>(sizeof conf->name - 1), name);
-        if ((rc = fill_target_conf(func, conf, n, full)) != KORV_OK)
-            break;
-    }
-    if (rc != KORV_OK) {
-        target_conf_free_list(&got);
-        return rc;
-    }
-    for (target_conf_t *conf : korv::list_records<target_conf_t>(&got)) {
-        list_remove(&conf->node);
-        list_append(&conf->node, out);
-    }
-    return KORV_OK;
+    return read_into(out, target_conf_free_list, [&](list_t *got) {
+        return walk_list(func, kTargetRoot, CONF_MAX_TARGETS, "name", CONF_NAME_LEN, nullptr,
+                         [&](int n, const char *name) -> int {
+                             target_conf_t *conf = target_conf_new();
+                             if (!conf) {
+                                 DBG_AS(func, 0, "new t_conf failed error");
+                                 return ERR_NO_MEMORY;
+                             }
+                             copy_cut(conf->name, name);
+                             int rc = fill_target_conf(func, conf, n, full);
+                             if (rc != KORV_OK) {
+                                 target_conf_free(conf);
+                                 return rc;
+                             }
+                             list_append(&conf->node, got);
+                             return KORV_OK;
+                         });
+    });
 }
 }  // namespace
 
 int xmldb_get_target_conf_by_name(target_conf_t *conf, const char *name)
 {
-    PARAM_ERROR_IF(!conf || !name);
+    PARAM_ERROR_IF(!conf || !name || !fits<CONF_NAME_LEN>(name));
     int n = find_target(__func__, name);
     if (n < 1)
         return n;
-    std::snprintf(conf->name, sizeof conf->name, "%s", name);
+    copy_cut(conf->name, name);
     return fill_target_conf(__func__, conf, n, true);
 }
 

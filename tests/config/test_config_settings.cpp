@@ -148,10 +148,12 @@ TEST_F(WholeStore, SaveWritesTheConfigurationFile)
     EXPECT_NE(SysRoot::read("/etc/NAS_CFG/config.xml").find("saved-target"), std::string::npos);
     EXPECT_NE(SysRoot::read("/usr/local/config/config.xml").find("saved-target"), std::string::npos);
 
-    // Nothing saved and nothing to copy: the copy's failure is the result.
+    // With the service down nothing is written, and the old file must not
+    // reach flash as if it were the new one.
+    SysRoot::remove("/usr/local/config");
     db().kill();
-    SysRoot::remove("/etc/NAS_CFG/config.xml");
-    EXPECT_NE(quiet([] { return xmldb_save_conf(); }), 0);
+    EXPECT_EQ(quiet([] { return xmldb_save_conf(); }), ERR_DB_WRITE);
+    EXPECT_EQ(SysRoot::read("/usr/local/config/config.xml"), "");
 }
 
 TEST(OperationsTable, SlotsSitAtTheirFixedPlacesAndOnlyProvidedOnesAreSet)

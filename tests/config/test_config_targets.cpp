@@ -32,11 +32,11 @@ target_conf_t *filled_target(const char *name, int chap = 0)
 }
 
 // The targets reader finds, as "name/tpgt/dbidx" per record.
-std::string read_targets(int (*reader)(list_t *))
+std::string read_targets(int (*reader)(list_t *), std::string *log = nullptr)
 {
     list_t list;
     list_init(&list);
-    EXPECT_EQ(quiet([&] { return reader(&list); }), KORV_OK);
+    EXPECT_EQ(quiet([&] { return reader(&list); }, log), KORV_OK);
     std::string out;
     for (target_conf_t *t : korv::list_records<target_conf_t>(&list))
         out += std::string(out.empty() ? "" : " ") + t->name + "/" + std::to_string(t->tpgt) + "/" +
@@ -120,6 +120,8 @@ TEST_F(TargetAdd, RefusesInvalidRecordsBeforeAnyWrite)
         void (*spoil)(target_conf_t *);
     } cases[] = {
         {"target_suffix error", [](target_conf_t *t) { t->name[0] = '\0'; }},
+        // 128 characters leave no room for the terminator: every reader would cut it.
+        {"target_suffix error", [](target_conf_t *t) { std::memset(t->name, 'n', sizeof t->name); }},
         {"IQN error", [](target_conf_t *t) { t->iqn[0] = '\0'; }},
         {"TPGT error", [](target_conf_t *t) { t->tpgt = -1; }},
         {"enable_chap error", [](target_conf_t *t) { t->chap_enable = 2; }},
@@ -255,6 +257,16 @@ TEST_F(TargetDelete, RecountCountsAcrossGapsAndRemovesOnlyTheGhostAtCountPlusOne
     EXPECT_EQ(raw(tpath(5, "status")), "");
     EXPECT_EQ(raw(tpath(7, "status")), "Ready");
     EXPECT_EQ(raw(tpath(4, "name")) + raw(tpath(6, "name")), "t4t6");
+
+    // After a middle delete, count + 1 is a real target: its status does not make it a ghost.
+    EXPECT_EQ(xmldb_clean_target_conf(), KORV_OK);
+    for (int n : {1, 2, 3}) {
+        put_target(n, "t" + std::to_string(n));
+        put(tpath(n, "status"), "Ready");
+    }
+    EXPECT_EQ(quiet([] { return xmldb_del_target_by_name("t2"); }), KORV_OK);
+    EXPECT_EQ(quiet([] { return xmldb_update_current_targetcnt(); }), KORV_OK);
+    EXPECT_EQ(raw(tpath(3, "name")) + raw(tpath(3, "iqn")), "t3iqn.2000-01.com.example:t3");
 }
 
 using TargetRead = StoreTest;
@@ -263,27 +275,36 @@ TEST_F(TargetRead, LiteReadsNamesAndTagsUpToTheFirstGap)
 {
     EXPECT_EQ(read_targets(xmldb_get_all_target_conf_lite), "");
     put_target(1, "a", 3);
-    put_target(2, std::string(200, 'n'), 4);  // cut to the record's field
+    put_target(2, "b", 4);
     put_target(4, "d", 5);
-    EXPECT_EQ(read_targets(iscsi_conf_ops.xmldb_get_all_target_conf_lite),
-              "a/3/1 " + std::string(CONF_NAME_LEN - 1, 'n') + "/4/2");
+    EXPECT_EQ(read_targets(iscsi_conf_ops.xmldb_get_all_target_conf_lite), "a/3/1 b/4/2");
 }
 
-TEST_F(TargetRead, LiteFailsAsAWholeOnAnUnreadableTagOrDatabase)
+TEST_F(TargetRead, BrokenRecordsAreSkippedAndOnlyADeadServiceFailsTheRead)
 {
+    // A name too long for the record is never cut (the cut name could be
+    // another target's); an unreadable tag costs only its own record.
     put_target(1, "a");
-    put_target(2, "b");
-    put(tpath(2, "tpgt"), "");
+    put_target(2, std::string(CONF_NAME_LEN, 'n'));
+    put_target(3, std::string(CONF_NAME_LEN - 1, 'n'));
+    put_target(4, "b");
+    put(tpath(4, "tpgt"), "");
+    put_target(5, "c");
+    std::string out;
+    const std::string good = "a/1/1 " + std::string(CONF_NAME_LEN - 1, 'n') + "/1/3 c/1/5";
+    EXPECT_EQ(read_targets(xmldb_get_all_target_conf_lite, &out), good);
+    EXPECT_NE(out.find("get tpgt error"), std::string::npos) << out;
+    EXPECT_NE(out.find("/iscsi/target/id:2/name is too long"), std::string::npos) << out;
+    EXPECT_EQ(read_targets(xmldb_get_all_target_conf), good);
+    target_conf_t *t = target_conf_new();
+    EXPECT_EQ(quiet([&] { return xmldb_get_target_conf_by_name(t, raw(tpath(2, "name")).c_str()); }), ERR_PARAM);
+    target_conf_free(t);
+
+    db().kill();
     list_t list;
     list_init(&list);
-    std::string out;
-    EXPECT_NE(quiet([&] { return xmldb_get_all_target_conf_lite(&list); }, &out), KORV_OK);
-    EXPECT_NE(out.find("get tpgt error"), std::string::npos) << out;
-    EXPECT_TRUE(list_is_empty(&list));
-
-    put(tpath(2, "tpgt"), "1");
-    db().kill();
     EXPECT_EQ(quiet([&] { return xmldb_get_all_target_conf_lite(&list); }), ERR_DB_CLIENT);
+    EXPECT_EQ(quiet([&] { return xmldb_get_all_target_conf(&list); }), ERR_DB_CLIENT);
     EXPECT_TRUE(list_is_empty(&list));
 }
 
