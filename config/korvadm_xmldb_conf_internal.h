@@ -3,6 +3,10 @@
 // functions of the scanner and counters (tests reach them here too).
 #pragma once
 
+// Every file of the unit logs under the unit's name.
+#undef KORV_LOG_UNIT
+#define KORV_LOG_UNIT "korvadm_xmldb_conf"
+
 #include <cstdarg>
 #include <cstddef>
 #include <cstdio>
