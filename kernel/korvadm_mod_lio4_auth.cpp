@@ -99,6 +99,8 @@ int push_chap(const char *func, const iscsi_target_t *target, const char *initia
 
 int _lio3_set_target_auth_ability(const char *iqn, int tpgt, int chap_flag)
 {
+    if (!tpgt_ok(tpgt))
+        return ERR_PARAM;
     return write_switch_and_auth_method(__func__, iqn, tpgt, "/attrib/authentication", chap_flag == 1 ? 1 : 0);
 }
 int _lio3_set_target_chap_all_acl(const iscsi_target_t *target)

@@ -3,11 +3,13 @@
 #include "kernel/korvadm_mod_lio4_internal.h"
 
 #include <sys/stat.h>
+#include <algorithm>
 #include <climits>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <memory>
+#include <new>
 #include <string>
 #include <string_view>
 #include <utility>
@@ -192,24 +194,29 @@ int configfs_read_attr_str(const char *path, char *buf, size_t size)
         DBG(0, "open attribute %s failed", path);
         return ERR_CONFIGFS;
     }
-    // Terminating at the count read keeps a full buffer (a verified write's
-    // read-back: value plus newline) from being read past its end.
-    size_t n = std::fread(buf, 1, size - 1, f.get());
-    bool failed = std::ferror(f.get()) != 0;
-    buf[n] = '\0';
-    if (failed) {
+    // Up to size bytes, one more than the caller keeps: a verified write's
+    // read-back then sees the kernel's own line end after the value and
+    // strips that one, not a line end inside the value.
+    std::unique_ptr<char[]> text(new (std::nothrow) char[size + 1]);
+    if (!text)
+        return ERR_NO_MEMORY;
+    size_t n = std::fread(text.get(), 1, size, f.get());
+    if (std::ferror(f.get())) {
         DBG(0, "read attribute %s failed", path);
         return ERR_CONFIGFS;
     }
-    DBG(2, "get |%s|", buf);
-    size_t len = std::strlen(buf);
+    text[n] = '\0';
+    DBG(2, "get |%s|", text.get());
+    size_t len = std::strlen(text.get());
     for (size_t k = 1; k <= 10 && k < len; ++k) {
-        if (buf[len - k] == '\n') {
-            buf[len - k] = '\0';
+        if (text[len - k] == '\n') {
+            len -= k;
             break;
         }
     }
-    buf[size - 1] = '\0';
+    size_t keep = std::min(len, size - 1);
+    std::memcpy(buf, text.get(), keep);
+    buf[keep] = '\0';
     return KORV_OK;
 }
 

@@ -16,24 +16,35 @@ using namespace lio4;
 
 namespace {
 
+// A portal's address and interface name end up inside one directory name.
+bool portal_names_ok(const char *address, const char *interface)
+{
+    return address && !std::strchr(address, '/') && (!interface || !*interface || is_component(interface));
+}
+
 std::string np_name(const char *address, const char *interface, int port, int type)
 {
     if (type != IP_TYPE_V4 && type != IP_TYPE_V6)
         type = _check_np_ip_type(address);
-    if (type == IP_TYPE_V4)
-        return std::string(address) + ":" + std::to_string(port);
-    // An address that does not parse is scoped too: the kernel then refuses
-    // it rather than binding an unintended address.
-    if (is_ipv6_link_local(address) != 0)
-        return "[" + std::string(address) + "%" + (interface ? interface : "") + "]:" + std::to_string(port);
-    return "[" + std::string(address) + "]:" + std::to_string(port);
+    std::string name;
+    if (type == IP_TYPE_V4) {
+        name = address;
+    } else {
+        name.append(1, '[').append(address);
+        // An address that does not parse is scoped too: the kernel then
+        // refuses it rather than binding an unintended address.
+        if (is_ipv6_link_local(address) != 0)
+            name.append(1, '%').append(interface ? interface : "");
+        name.append(1, ']');
+    }
+    return name.append(1, ':').append(std::to_string(port));
 }
 
 // The np directory of a portal; false when the arguments cannot name one.
 bool np_path(const char *iqn, int tpgt, const char *interface, const char *address, int port, int type,
              std::string &path)
 {
-    if (!iqn || !address || !*address || std::strchr(address, '/') || !tpgt_ok(tpgt))
+    if (!iqn || !address || !*address || !portal_names_ok(address, interface) || !tpgt_ok(tpgt))
         return false;
     path = tpg_dir(iqn, tpgt) + "/np/" + np_name(address, interface, port, type);
     return true;
@@ -93,8 +104,19 @@ void create_portals(const char *func, iscsi_target_t *target, list_t *existing)
     }
 }
 
-// The kernel's portals of target, appended to list in directory order only
-// when all of them could be read.
+// A wanted list is refused whole, before anything changes, when one of its
+// names could leave the portal's directory.
+bool wanted_portals_ok(const char *func, const iscsi_target_t *target)
+{
+    for (const iscsi_ip_t *ip : korv::list_records<iscsi_ip_t>(&target->ip_list)) {
+        if (!portal_names_ok(ip->ipv4, ip->dev_name) || !portal_names_ok(ip->ipv6, ip->dev_name)) {
+            DBG_AS(func, 0, "portal %s%s on interface %s is not a usable name", ip->ipv4, ip->ipv6, ip->dev_name);
+            return false;
+        }
+    }
+    return true;
+}
+
 }  // namespace
 
 int _get_exist_ip_list(const iscsi_target_t *target, list_t *list)
@@ -158,6 +180,8 @@ int _lio3_remove_all_np(const iscsi_target_t *target)
 int lio3_set_target_ip(iscsi_target_t *target)
 {
     CHECK_TARGET(target, "target is NULL", "target IQN is empty", "target TPGT out of limitation");
+    if (!wanted_portals_ok(__func__, target))
+        return ERR_PARAM;
     if (_lio3_remove_all_np(target) != 0)
         DBG(0, "_lio3_remove_all_np error");
     create_portals(__func__, target, nullptr);
@@ -167,6 +191,8 @@ int lio3_set_target_ip(iscsi_target_t *target)
 int lio3_set_target_ip_v2(iscsi_target_t *target)
 {
     CHECK_TARGET(target, "target is NULL", "target IQN is empty", "target TPGT out of limitation");
+    if (!wanted_portals_ok(__func__, target))
+        return ERR_PARAM;
     ip_list_guard existing;
     if (_get_exist_ip_list(target, &existing.list) != 0)
         DBG(0, "_get_exist_ip_list error");

@@ -24,11 +24,12 @@ constexpr const char *AUTH_METHOD = "CHAP,None";
 namespace lio4 {
 
 // Writes value to the portal group's attribute `rel` and verifies it; the
-// log shows the value as `shown`, under `func`.
+// log shows the value as `shown`, under `func`. Any tag the kernel shows is
+// taken: the teardown disables groups the appliance would not have made.
 int write_tpg_attr(const char *func, const char *iqn, int tpgt, const char *rel, const std::string &value,
                    const char *shown)
 {
-    if (!iqn || !tpgt_ok(tpgt))
+    if (!iqn || tpgt < 0)
         return ERR_PARAM;
     std::string path = tpg_dir(iqn, tpgt) + rel;
     if (configfs_write_attr_str(path.c_str(), value.c_str(), 1) != 0) {
@@ -60,29 +61,31 @@ namespace {
 
 int _lio3_set_enable_default_policy(const char *iqn, int tpgt, int enable)
 {
+    if (!tpgt_ok(tpgt))
+        return ERR_PARAM;
     return write_tpg_attr(__func__, iqn, tpgt, "/attrib/generate_node_acls", enable ? "1" : "0",
                           enable ? "Enable" : "Disable");
 }
 
 int _lio3_set_mcs_max_connection(const char *iqn, int tpgt, int max_conn)
 {
-    return write_tpg_attr(__func__, iqn, tpgt, "/param/MaxConnections", max_conn);
+    return tpgt_ok(tpgt) ? write_tpg_attr(__func__, iqn, tpgt, "/param/MaxConnections", max_conn) : ERR_PARAM;
 }
 
 int _lio3_set_target_alias(const char *iqn, int tpgt, const char *alias)
 {
-    return alias ? write_tpg_attr(__func__, iqn, tpgt, "/param/TargetAlias", alias, alias) : ERR_PARAM;
+    return alias && tpgt_ok(tpgt) ? write_tpg_attr(__func__, iqn, tpgt, "/param/TargetAlias", alias, alias) : ERR_PARAM;
 }
 
 int _lio3_set_target_default_cmdsn_depth(const char *iqn, int tpgt, int depth)
 {
-    return depth >= 0 ? write_tpg_attr(__func__, iqn, tpgt, "/attrib/default_cmdsn_depth", depth) : ERR_PARAM;
+    return depth >= 0 && tpgt_ok(tpgt) ? write_tpg_attr(__func__, iqn, tpgt, "/attrib/default_cmdsn_depth", depth) : ERR_PARAM;
 }
+
+}  // namespace
 
 // Every step is tried even after a failure, so one refused attribute does
 // not leave the others at the kernel's defaults.
-}  // namespace
-
 int _set_target_default_attributes(const iscsi_target_t *target)
 {
     std::string alias = field(target->alias);
@@ -154,7 +157,10 @@ int lio3_add_target(iscsi_target_t *target)
         DBG(2, "target : %s , already exist", tpg.c_str());
         return KORV_OK;
     }
+    std::string iqn = iqn_dir(target->iqn);
     std::string alua = sysroot_path(VAR_ALUA_DIR) + "/iSCSI/" + target->iqn + "+" + std::to_string(target->tpgt);
+    bool iqn_existed = configfs_path_exist(iqn.c_str()) == 0;
+    bool alua_existed = check_path_exist(alua.c_str()) == 0;
     int rc = configfs_mkdir(tpg.c_str());
     if (rc == 0 && configfs_path_exist(tpg.c_str()) != 0) {
         DBG(0, "create tpg node: %s failed", tpg.c_str());
@@ -165,9 +171,15 @@ int lio3_add_target(iscsi_target_t *target)
         rc = ERR_CONFIGFS;
     }
     if (rc != 0) {
+        // Only what this call made goes: its portal group, the IQN directory
+        // when no other group holds it, a state directory that is new.
         DBG(0, "lio3_add_target failed, rc = %d", rc);
-        remove_configfs_group(iqn_dir(target->iqn));
-        remove_dir_recurive(alua.c_str());
+        if (configfs_path_exist(tpg.c_str()) == 0)
+            remove_configfs_group(tpg);
+        if (!iqn_existed && configfs_path_exist(iqn.c_str()) == 0)
+            configfs_rmdir(iqn.c_str());
+        if (!alua_existed)
+            remove_dir_recurive(alua.c_str());
         return rc;
     }
     if (_set_target_default_attributes(target) != 0)
@@ -179,40 +191,51 @@ int lio3_add_target(iscsi_target_t *target)
     return KORV_OK;
 }
 
-int lio3_del_target(iscsi_target_t *target)
+namespace {
+
+// Deletion once the target is checked; the teardown calls it for every tag
+// the kernel shows, management operations only for 0..63.
+int remove_tpg(const char *func, iscsi_target_t *target)
 {
-    CHECK_TARGET(target, "target is NULL", "target IQN is empty", "target tpgt is wrong: %d", target->tpgt);
     std::string tpg = tpg_dir(target->iqn, target->tpgt);
     if (configfs_path_exist(tpg.c_str()) != 0) {
-        DBG(2, "target : %s , already removed", tpg.c_str());
+        DBG_AS(func, 2, "target : %s , already removed", tpg.c_str());
         return KORV_OK;
     }
     if (_lio3_set_target_enable(target, 0) != 0) {
-        DBG(0, "disable target failed");
+        DBG_AS(func, 0, "disable target failed");
         return ERR_CONFIGFS;
     }
     if (_lio3_remove_all_np(target) != 0) {
-        DBG(0, "remove network portal failed");
+        DBG_AS(func, 0, "remove network portal failed");
         return ERR_CONFIGFS;
     }
     if (_lio3_remove_all_acl(target) != 0) {
-        DBG(0, "remove all acl node failed");
+        DBG_AS(func, 0, "remove all acl node failed");
         return ERR_CONFIGFS;
     }
     if (_lio3_remove_all_lun(target) != 0) {
-        DBG(0, "remove all lun node failed");
+        DBG_AS(func, 0, "remove all lun node failed");
         return ERR_CONFIGFS;
     }
     if (configfs_rmdir(tpg.c_str()) != 0) {
-        DBG(0, "remove tpg node failed: %s", tpg.c_str());
+        DBG_AS(func, 0, "remove tpg node failed: %s", tpg.c_str());
         return ERR_CONFIGFS;
     }
     std::string iqn = iqn_dir(target->iqn);
     if (configfs_rmdir(iqn.c_str()) != 0) {
-        DBG(0, "remove iqn node failed: %s", iqn.c_str());
+        DBG_AS(func, 0, "remove iqn node failed: %s", iqn.c_str());
         return ERR_CONFIGFS;
     }
     return KORV_OK;
+}
+
+}  // namespace
+
+int lio3_del_target(iscsi_target_t *target)
+{
+    CHECK_TARGET(target, "target is NULL", "target IQN is empty", "target tpgt is wrong: %d", target->tpgt);
+    return remove_tpg(__func__, target);
 }
 
 int lio3_enable_target(iscsi_target_t *target)
@@ -275,16 +298,24 @@ int lio3_set_target_attr_dataout_timeout(int timeout, iscsi_target_t *target)
     return KORV_OK;
 }
 
+namespace {
+// The teardown's check: any tag the kernel shows.
+bool teardown_ok(const iscsi_target_t *t)
+{
+    return t && is_component(field(t->iqn)) && t->tpgt >= 0;
+}
+}  // namespace
+
 int _lio3_remove_all_acl(iscsi_target_t *target)
 {
-    if (check_target(target) != tcheck::ok)
+    if (!teardown_ok(target))
         return ERR_PARAM;
     return remove_all_subdirs(__func__, tpg_dir(target->iqn, target->tpgt) + "/acls");
 }
 
 int _lio3_remove_all_lun(iscsi_target_t *target)
 {
-    if (check_target(target) != tcheck::ok)
+    if (!teardown_ok(target))
         return ERR_PARAM;
     return remove_all_subdirs(__func__, tpg_dir(target->iqn, target->tpgt) + "/lun");
 }
@@ -306,7 +337,7 @@ int _lio3_remove_all_tpgt(iscsi_target_t *target)
         if (at == std::string::npos || !leading_number(std::string_view(name).substr(at + 5), tpgt))
             continue;
         target->tpgt = tpgt;
-        if (lio3_del_target(target) != 0) {
+        if (remove_tpg("lio3_del_target", target) != 0) {
             DBG(0, "lio3_del_target |%s:tpgt_%d| failed", target->iqn, tpgt);
             rc = ERR_CONFIGFS;
         }

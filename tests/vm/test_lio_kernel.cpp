@@ -215,6 +215,9 @@ TEST_F(LioModules, StopTearsDownEverythingTheKernelHolds)
     ASSERT_EQ(lio3_add_target(full2.get()), 0);
     ASSERT_EQ(lio3_add_target(second1.get()), 0);
     hand_made_backstore("fileio_3", "sparedisk"); // mapped nowhere
+    // Groups the driver would not make: a tag the kernel takes past 63.
+    ASSERT_EQ(::system(("mkdir -p " + kIscsi + "/iqn.2026-01.vm:stop-full/tpgt_64 " + kIscsi +
+                        "/iqn.2026-01.vm:by-hand/tpgt_64").c_str()), 0);
     // With configuration present the kernel refuses to unload the modules,
     // so the driver must have emptied configfs first, in an order it accepts.
     ASSERT_NE(::system("rmmod iscsi_target_mod 2>/dev/null"), 0);
@@ -311,20 +314,34 @@ TEST_F(LioTarget, AddCreatesThePortalGroupWithItsDefaultsOnce)
     EXPECT_TRUE(exists(kIscsi + "/" + t_->iqn + "/tpgt_0"));
 }
 
-TEST_F(LioTarget, AddRollsBackTheKernelsGroupsWhenItsStateDirectoryCannotBeMade)
+TEST_F(LioTarget, AFailedAddTakesDownOnlyWhatItMade)
 {
-    // A file where the ALUA state directory must go: the portal group is
-    // made in the kernel first, then must be taken down again group by group.
+    // A working sibling under the same IQN: enabled, listening, with an ACL.
+    ASSERT_EQ(lio3_add_target(t_.get()), 0);
+    want_portal(t_.get(), "127.0.0.1", "", 3260);
+    ASSERT_EQ(lio3_set_target_ip(t_.get()), 0);
+    hand_made_acl(tpg_, "iqn.2026-01.vm:init-rb");
+    ASSERT_EQ(lio3_enable_target(t_.get()), 0);
+    Target sibling = make_target(t_->iqn, 2), fresh = make_target(std::string(t_->iqn) + "-fresh", 1);
+
+    // A file where the ALUA state directories must go: each portal group is
+    // made in the kernel first, then must be taken down again.
     ASSERT_EQ(::rename("/var/target/alua", "/var/target/alua.saved"), 0);
     { std::ofstream blocker("/var/target/alua"); }
-    int rc = lio3_add_target(t_.get());
+    int rc_sibling = lio3_add_target(sibling.get()), rc_fresh = lio3_add_target(fresh.get());
     ::unlink("/var/target/alua");
     ASSERT_EQ(::rename("/var/target/alua.saved", "/var/target/alua"), 0);
 
-    EXPECT_EQ(rc, ERR_CONFIGFS);
-    EXPECT_FALSE(exists(kIscsi + "/" + t_->iqn)) << "the half-made target stayed in the kernel";
-    EXPECT_EQ(lio3_add_target(t_.get()), 0) << "and a second try works";
-    EXPECT_EQ(attr("attrib/generate_node_acls"), "1\n");
+    EXPECT_EQ(rc_sibling, ERR_CONFIGFS);
+    EXPECT_FALSE(exists(tpg_dir(sibling.get())));
+    EXPECT_EQ(attr("enable"), "1\n");
+    EXPECT_EQ(subdirs(tpg_ + "/acls"), std::vector<std::string>{"iqn.2026-01.vm:init-rb"});
+    EXPECT_TRUE(kernel_listens(3260, false)) << "the sibling's portal closed";
+    EXPECT_EQ(rc_fresh, ERR_CONFIGFS);
+    EXPECT_FALSE(exists(kIscsi + "/" + fresh->iqn)) << "the half-made target stayed in the kernel";
+    EXPECT_EQ(lio3_add_target(fresh.get()), 0) << "and a second try works";
+    EXPECT_EQ(slurp(tpg_dir(fresh.get()) + "/attrib/generate_node_acls"), "1\n");
+    EXPECT_EQ(lio3_del_target(fresh.get()), 0);
 }
 
 TEST_F(LioTarget, AttributePrimitivesAgainstTheKernel)
@@ -347,6 +364,9 @@ TEST_F(LioTarget, AttributePrimitivesAgainstTheKernel)
     // Values with shell metacharacters reach the kernel as text.
     EXPECT_EQ(configfs_write_attr_str((tpg_ + "/param/TargetAlias").c_str(), "a \"b\" $(c) `d`;e", 1), 0);
     EXPECT_EQ(attr("param/TargetAlias"), "a \"b\" $(c) `d`;e\n");
+    // A line end inside the value: the kernel's own is the one stripped.
+    EXPECT_EQ(configfs_write_attr_str((tpg_ + "/param/TargetAlias").c_str(), "a\nbc", 1), 0);
+    EXPECT_EQ(attr("param/TargetAlias"), "a\nbc\n");
 }
 
 TEST_F(LioTarget, PortalsOfEveryKindAreCreatedListenedOnAndListed)
@@ -369,6 +389,27 @@ TEST_F(LioTarget, PortalsOfEveryKindAreCreatedListenedOnAndListed)
     EXPECT_EQ(reported_portals(t_.get(), &rc),
               (std::vector<std::string>{"127.0.0.1||3260|", "|::1|3261|", "|" + ll + "|3262|dummy0"}));
     EXPECT_EQ(rc, 0);
+}
+
+TEST_F(LioTarget, AnInterfaceNameThatLeavesThePortalDirectoryCreatesNothing)
+{
+    const std::string ll = vm::link_local_of("dummy0");
+    ASSERT_FALSE(ll.empty()) << "dummy0 has no link-local address";
+    ASSERT_EQ(lio3_add_target(t_.get()), 0);
+    want_portal(t_.get(), "", ll, 3262, "dummy0");
+    ASSERT_EQ(lio3_set_target_ip(t_.get()), 0);
+    const std::string portal = tpg_ + "/np/[" + ll + "%dummy0]:3262";
+    const ino_t kept = inode_of(portal);
+    // Through that portal's directory: out of configfs, and into the fabric.
+    want_portal(t_.get(), "", ll, 3262, "dummy0]:3262/../../../../../../../../../../tmp/escaped");
+    want_portal(t_.get(), "", ll, 3262, "dummy0]:3262/../../../../iqn.2026-01.vm:other");
+
+    EXPECT_EQ(lio3_set_target_ip(t_.get()), ERR_PARAM);
+
+    EXPECT_EQ(subdirs(tpg_ + "/np"), std::vector<std::string>{"[" + ll + "%dummy0]:3262"});
+    EXPECT_EQ(inode_of(portal), kept) << "the wanted list was not refused before anything changed";
+    EXPECT_FALSE(exists("/tmp/escaped]:3262"));
+    EXPECT_FALSE(exists(kIscsi + "/iqn.2026-01.vm:other]:3262"));
 }
 
 TEST_F(LioTarget, PortalsAreReplacedOrDiffedByAddress)
