@@ -36,21 +36,33 @@ struct pipe_closer {
 };
 using pipe_ptr = std::unique_ptr<std::FILE, pipe_closer>;
 
-// A format that holds exactly one %s and otherwise only %% is safe to hand
-// to the printf-style runner with one string argument.
-bool has_single_string_conversion(std::string_view fmt)
+// A format that holds exactly one %s, outside any quotes, and otherwise only
+// %% is safe to hand to the printf-style runner with one quoted value: a %s
+// inside the format's own quotes would end them and let the value run.
+bool has_single_bare_string_conversion(std::string_view fmt)
 {
     int strings = 0;
+    char quote = 0;
     for (size_t i = 0; i < fmt.size(); ++i) {
-        if (fmt[i] != '%')
-            continue;
-        if (i + 1 >= fmt.size())
-            return false;
-        char c = fmt[++i];
-        if (c == 's')
-            ++strings;
-        else if (c != '%')
-            return false;
+        char c = fmt[i];
+        if (c == '%') {
+            if (i + 1 >= fmt.size())
+                return false;
+            c = fmt[++i];
+            if (c == 's' && !quote)
+                ++strings;
+            else if (c != '%')
+                return false;
+        } else if (quote) {
+            if (c == quote)
+                quote = 0;
+            else if (c == '\\' && quote == '"')
+                ++i;
+        } else if (c == '\\') {
+            ++i;
+        } else if (c == '\'' || c == '"') {
+            quote = c;
+        }
     }
     return strings == 1;
 }
@@ -229,7 +241,7 @@ int create_file_if_absent(const char *path, mode_t mode)
         return -1;
     if (access(path, F_OK) == 0)
         return 0;
-    int fd = open(path, O_CREAT | O_EXCL | O_WRONLY, mode);
+    int fd = open(path, O_CREAT | O_EXCL | O_NOFOLLOW | O_WRONLY | O_CLOEXEC, mode);
     if (fd < 0)
         return -1;
     close(fd);
@@ -248,9 +260,13 @@ int check_dir_is_writable(const char *dir, const char *name, unsigned long long 
         if (!buf)
             return -1;
     }
+    // Never an existing entry: on a volume users write to, a link or file
+    // planted at this name must not make us truncate or remove anything.
     std::string path = std::string(dir) + "/" + name;
-    std::FILE *f = std::fopen(path.c_str(), "w");
-    if (!f) {
+    int fd = open(path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600);
+    if (fd < 0) {
+        if (errno == EEXIST)
+            DBG(0, "%s already exists and is left alone: not writable", path.c_str());
         DBG(1, "open file %s failed", path.c_str());
         return -1;
     }
@@ -258,15 +274,16 @@ int check_dir_is_writable(const char *dir, const char *name, unsigned long long 
     unsigned long long left = count;
     while (left > 0) {
         size_t chunk = left < buf_size ? static_cast<size_t>(left) : buf_size;
-        std::clearerr(f);
-        if (std::fwrite(buf.get(), 1, chunk, f) != chunk || std::ferror(f)) {
+        ssize_t n = write(fd, buf.get(), chunk);
+        if (n < 0 && errno == EINTR)
+            continue;
+        if (n <= 0) {
             rc = -1;
             break;
         }
-        left -= chunk;
+        left -= static_cast<unsigned long long>(n);
     }
-    // A full disk may only show when the buffered tail is flushed.
-    if (std::fclose(f) != 0)
+    if (close(fd) != 0)
         rc = -1;
     unlink(path.c_str());
     return rc;
@@ -308,14 +325,16 @@ int create_symlink(const char *target, const char *link)
 
 int run_system_cmd(const char *fmt, const char *arg)
 {
-    if (!fmt || !arg || !has_single_string_conversion(fmt))
+    if (!fmt || !arg || !has_single_bare_string_conversion(fmt))
         return -1;
+    // The value is one double-quoted shell word whatever the format does.
     std::string escaped;
     if (!korv::shell_escape(arg, escaped))
         return -1;
+    std::string quoted = "\"" + escaped + "\"";
 #pragma GCC diagnostic push
 #pragma GCC diagnostic ignored "-Wformat-nonliteral"
-    int status = System(fmt, escaped.c_str());
+    int status = System(fmt, quoted.c_str());
 #pragma GCC diagnostic pop
     return status == 0 ? 0 : -1;
 }

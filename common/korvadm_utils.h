@@ -51,7 +51,9 @@ int remove_file(const char *path);
  * 0700), empty. -1 when it can be neither found nor created. */
 int create_file_if_absent(const char *path, mode_t mode);
 /* Proves that `dir` accepts `count` bytes: writes them as zeros to dir/name,
- * then closes and removes the file whatever happened. 0 / -1. */
+ * a file it creates itself, then closes and removes it whatever happened.
+ * An existing entry of that name (file or link) is never followed, truncated
+ * or removed: it answers -1 (logged). 0 / -1. */
 int check_dir_is_writable(const char *dir, const char *name, unsigned long long count);
 /* Bytes allocated on disk for path (512-byte blocks x 512, not the length)
  * into *size; on failure *size is 0 and -1 is returned. */
@@ -63,9 +65,10 @@ int create_symlink(const char *target, const char *link);
 
 /* ---- commands ---- */
 
-/* Runs fmt with `arg` through the shell. `arg` is escaped for use inside
- * double quotes, so REQUIRES: fmt places its one %s inside "...".
- * 0 when the command exits 0, else -1. */
+/* Runs fmt with `arg` through the shell. fmt holds one %s outside any quotes
+ * (and otherwise only %%); `arg` takes its place escaped and inside double
+ * quotes, one shell word that never runs. 0 when the command exits 0; -1
+ * when it fails or the format is refused. */
 int run_system_cmd(const char *fmt, const char *arg);
 /* Runs cmd with system() up to `tries` times until it exits 0, waiting a
  * random 0..max_delay_us-1 microseconds before each retry (when max_delay_us
