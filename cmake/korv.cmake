@@ -1,10 +1,12 @@
 # Small helpers shared by every directory's CMakeLists.
 
-# korv_library(NAME DIR SOURCES... [DEPS libs...])
-# A static library of one subsystem directory; its public headers install under include/korvadm/DIR.
+# korv_library(NAME DIR SOURCES... HEADERS... [DEPS libs...])
+# A static library of one layer. Sources and headers are listed by name
+# (relative to the calling CMakeLists), never globbed: a file joins a library
+# because it is listed there. The public headers install under include/korvadm/DIR.
 function(korv_library name dir)
-  cmake_parse_arguments(K "" "" "SOURCES;DEPS" ${ARGN})
-  add_library(${name} STATIC ${K_SOURCES})
+  cmake_parse_arguments(K "" "" "SOURCES;HEADERS;DEPS" ${ARGN})
+  add_library(${name} STATIC ${K_SOURCES} ${K_HEADERS})
   target_include_directories(${name} PUBLIC
     $<BUILD_INTERFACE:${KORV_INCLUDE_ROOT}>
     $<INSTALL_INTERFACE:${CMAKE_INSTALL_INCLUDEDIR}/korvadm>)
@@ -12,6 +14,5 @@ function(korv_library name dir)
     target_link_libraries(${name} PUBLIC ${K_DEPS})
   endif()
   install(TARGETS ${name} ARCHIVE DESTINATION ${CMAKE_INSTALL_LIBDIR})
-  file(GLOB headers ${CMAKE_CURRENT_SOURCE_DIR}/*.h)
-  install(FILES ${headers} DESTINATION ${CMAKE_INSTALL_INCLUDEDIR}/korvadm/${dir})
+  install(FILES ${K_HEADERS} DESTINATION ${CMAKE_INSTALL_INCLUDEDIR}/korvadm/${dir})
 endfunction()

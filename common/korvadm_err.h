@@ -7,6 +7,8 @@
 #ifndef KORVADM_ERR_H
 #define KORVADM_ERR_H
 
+#include "common/korvadm_log.h"
+
 #ifdef __cplusplus
 extern "C" {
 #endif
@@ -41,6 +43,27 @@ enum korv_rc {
     ID_ENTRY_FOUND     = 5,
     ID_ENTRY_NOT_FOUND = 6,
 };
+
+/* The argument guard of an operation answering result codes:
+ *
+ *   PARAM_GUARD(!name || !name[0]);              logs "parameter error"
+ *   PARAM_GUARD(!addr, "addr is NULL");          logs its own message
+ *
+ * When the condition holds, logs at level 0 under the calling function and
+ * returns ERR_PARAM (-9989) from it. At most four values may follow the
+ * message. */
+#define PARAM_GUARD(...)                                                                 \
+    KORV_PARAM_GUARD_PICK(__VA_ARGS__, KORV_PARAM_GUARD_MSG, KORV_PARAM_GUARD_MSG, KORV_PARAM_GUARD_MSG, \
+                          KORV_PARAM_GUARD_MSG, KORV_PARAM_GUARD_MSG, KORV_PARAM_GUARD_PLAIN, )(__VA_ARGS__)
+#define KORV_PARAM_GUARD_PICK(a1, a2, a3, a4, a5, a6, name, ...) name
+#define KORV_PARAM_GUARD_PLAIN(refused) KORV_PARAM_GUARD_MSG(refused, "parameter error")
+#define KORV_PARAM_GUARD_MSG(refused, ...) \
+    do {                                   \
+        if (refused) {                     \
+            DBG(0, __VA_ARGS__);           \
+            return ERR_PARAM;              \
+        }                                  \
+    } while (0)
 
 /* Short English meaning of a code, for messages and tests; never NULL. */
 const char *korv_rc_str(int rc);

@@ -91,6 +91,51 @@ int list_add_unique(list_t *list, T *rec, list_node_t *node_of_rec, Eq equal_key
     return 0;
 }
 
+/* Owns a C list of records for a C++ scope: the records still listed when it
+ * goes out of scope are released with the kind's list free function
+ * (target_conf_free_list, iscsi_ip_free_list, ...).
+ *
+ *   korv::list_owner ips(iscsi_ip_free_list);
+ *   iscsi_mod_get_target_ip_list_in_target_parm(ips.get(), iqn, tpgt); */
+class list_owner {
+public:
+    explicit list_owner(void (*free_list)(list_t *)) : free_list_(free_list) { list_init(&list_); }
+    ~list_owner() { free_list_(&list_); }
+    list_owner(const list_owner &) = delete;
+    list_owner &operator=(const list_owner &) = delete;
+
+    list_t *get() { return &list_; }
+    const list_t *get() const { return &list_; }
+
+    /* Moves every record, in order, to the tail of out; this list is left
+     * empty, so nothing is released here any more. */
+    void hand_over(list_t *out)
+    {
+        while (list_node_t *node = list_.head) {
+            list_remove(node);
+            list_append(node, out);
+        }
+    }
+
+private:
+    list_t list_;
+    void (*free_list_)(list_t *);
+};
+
+/* The "all or nothing" reader: fill(private_list) reads records into a list
+ * of its own; when it returns 0 they are handed over to the tail of out,
+ * otherwise they are released with free_list and out stays as it was, so a
+ * caller never sees half a set. Returns what fill returned. */
+template <class Fill>
+int fill_and_hand_over(list_t *out, void (*free_list)(list_t *), Fill fill)
+{
+    list_owner got(free_list);
+    int rc = fill(got.get());
+    if (rc == 0)
+        got.hand_over(out);
+    return rc;
+}
+
 }  // namespace korv
 #endif
 

@@ -8,6 +8,7 @@
 
 #include "common/korvadm_err.h"
 #include "common/korvadm_log.h"
+#include "common/korvadm_str.h"
 #include "platform/platform_util.h"
 
 /* ---------------------------------------------------------------------------
@@ -122,7 +123,7 @@ int copy_dev_name(const char *func, char *dev_name, const char *dev)
         DBG_AS(func, 0, "dev_name is NULL");
         return ERR_PARAM;
     }
-    std::snprintf(dev_name, ISCSI_IP_DEV_LEN, "%s", dev);
+    korv::copy_bounded(dev_name, ISCSI_IP_DEV_LEN, dev);
     return KORV_OK;
 }
 
@@ -131,10 +132,7 @@ int _get_lan2_dev_name(char *dev_name) { return copy_dev_name(__func__, dev_name
 
 int read_ipv4(char *addr, const char *path, const char *fail)
 {
-    if (!addr) {
-        DBG(0, "addr is NULL");
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(!addr, "addr is NULL");
     addr[0] = '\0';
     dbGetStr(addr, ISCSI_IP_IPV4_LEN, path);
     if (!addr[0]) {
@@ -165,10 +163,7 @@ void read_ipv6_mode(char (&mode)[kModeLen], int lan)
 // The address the LAN's IPv6 mode selects; "off" is an empty address, not an error.
 int _xmldb_get_nth_lan_ipv6_address(char *addr, int lan)
 {
-    if (!addr) {
-        DBG(0, "addr is NULL");
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(!addr, "addr is NULL");
     std::memset(addr, 0, ISCSI_IP_IPV6_LEN);
     char mode[kModeLen];
     read_ipv6_mode(mode, lan);
@@ -265,10 +260,7 @@ int append_port(list_t *list, const PortSource &src, bool with_ipv6)
 
 int sys_net_get_ip_list(list_t *list)
 {
-    if (!list) {
-        DBG(0, "parameter error: ip_list is NULL");
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(!list, "parameter error: ip_list is NULL");
     const bool lan1_up = LIB_Get_Lan_Link_Speed(0) != 0;
     const bool lan2_up = LIB_Get_Lan_Link_Speed(1) != 0;
     const bool ipv6 = _xmldb_get_ipv6_state() == 1;
@@ -311,7 +303,7 @@ int sys_net_get_host_name(char *out, size_t size, int refresh)
         }
     }
     // Bounded by the caller's size too: a short buffer gets a cut name, never an overrun.
-    std::snprintf(out, size, "%s", g_host_name);
+    korv::copy_bounded(out, size, g_host_name);
     return KORV_OK;
 }
 
@@ -329,10 +321,7 @@ int sys_net_get_host_name_in_iqn_spec(char *out, size_t size, int refresh)
 
 int sys_net_get_lan1_mac_str(char *out)
 {
-    if (!out) {
-        DBG(0, "parameter error");
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(!out);
     const unsigned char *mac = sys_get_mac_addr(kLan1Dev);
     if (!mac) {
         DBG(0, "get mac address of %s failed", kLan1Dev);

@@ -7,6 +7,7 @@
 #include <sys/ipc.h>
 #include <sys/sem.h>
 #include <sys/stat.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -24,17 +25,8 @@
 
 namespace {
 
-struct free_deleter {
-    void operator()(void *p) const { std::free(p); }
-};
-using c_buffer = std::unique_ptr<char, free_deleter>;
-
+using korv::c_buffer;
 using korv::file_ptr;
-
-struct pipe_closer {
-    void operator()(std::FILE *f) const { pclose(f); }
-};
-using pipe_ptr = std::unique_ptr<std::FILE, pipe_closer>;
 
 // A format that holds exactly one %s, outside any quotes, and otherwise only
 // %% is safe to hand to the printf-style runner with one quoted value: a %s
@@ -99,15 +91,31 @@ int read_prealloc_pid(const char *lun_name)
 }  // namespace
 
 namespace korv {
-bool shell_escape(const char *src, std::string &out)
+int read_command_lines(const char *cmd, const std::function<bool(std::string_view line)> &on_line)
 {
-    if (!src)
-        return false;
-    c_buffer escaped(str_insert_back_slash(src));
-    if (!escaped)
-        return false;
-    out.assign(escaped.get());
-    return true;
+    if (!cmd)
+        return -1;
+    std::fflush(stdout);
+    std::FILE *p = popen(cmd, "r");
+    if (!p)
+        return -1;
+    char *line = nullptr;
+    size_t cap = 0;
+    ssize_t n;
+    while ((n = getline(&line, &cap, p)) >= 0) {
+        std::string_view text(line, static_cast<size_t>(n));
+        if (!text.empty() && text.back() == '\n')
+            text.remove_suffix(1);
+        if (!on_line(text))
+            break;
+    }
+    std::free(line);
+    int status = pclose(p);
+    if (status == -1)
+        return -1;
+    if (WIFEXITED(status))
+        return WEXITSTATUS(status);
+    return WIFSIGNALED(status) ? 128 + WTERMSIG(status) : -1;
 }
 }  // namespace korv
 
@@ -443,15 +451,17 @@ void stop_prealloc(const char *lun_name)
 
 int check_any_prealloc_running(void)
 {
-    pipe_ptr p(popen("ps | grep prealloc | grep -v 'grep'", "r"));
-    if (!p) {
+    // The first line decides, as it always has.
+    int found = 0;
+    int status = korv::read_command_lines("ps | grep prealloc | grep -v 'grep'", [&](std::string_view line) {
+        found = line.find("prealloc") != std::string_view::npos;
+        return false;
+    });
+    if (status == -1) {
         DBG(0, "failed to check running process!");
         return -1;
     }
-    char line[512] = "";
-    if (!std::fgets(line, sizeof line, p.get()))
-        return 0;
-    return std::strstr(line, "prealloc") ? 1 : 0;
+    return found;
 }
 
 void kill_all_prealloc(void)

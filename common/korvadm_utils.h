@@ -5,7 +5,7 @@
  * (escaped) with optional randomised retry, the System V semaphore used as a
  * cross-process lock, control of the background "prealloc" processes that
  * pre-allocate LUN files, and small text checks (names, IPv6 addresses).
- * The database half of the utilities lives in config/korvadm_utils.h.
+ * The database half of the utilities lives in config/korvadm_utils_db.h.
  *
  * Paths given to these helpers are used as they are (already mapped through
  * the system root); only the fixed paths read here ("/proc/modules",
@@ -118,8 +118,12 @@ int is_ipv6_link_local(const char *text);
 }
 
 #include <cstdio>
+#include <functional>
 #include <memory>
 #include <string>
+#include <string_view>
+
+#include "common/korvadm_str.h"
 
 namespace korv {
 /* A stdio stream closed when it goes out of scope. */
@@ -128,10 +132,14 @@ struct file_closer {
 };
 using file_ptr = std::unique_ptr<std::FILE, file_closer>;
 
-/* src with a backslash before each $, ", \ and `, for use inside a
- * double-quoted shell word (the platform's str_insert_back_slash). False
- * (out untouched) for NULL or when memory is short. */
-bool shell_escape(const char *src, std::string &out);
+/* The one reader of commands whose output is parsed ("df", "powermgmt -s",
+ * "ps"): runs cmd through the shell (standard output flushed first) and
+ * hands each line of its standard output, without the line end, to on_line
+ * until on_line returns false. Returns the command's exit status as System()
+ * does (0..255, 128+N when it died of signal N; a command cut short by a
+ * false from on_line may die of SIGPIPE), or -1 when it could not be run.
+ * cmd is run as given: values in it must be escaped (shell_escape). */
+int read_command_lines(const char *cmd, const std::function<bool(std::string_view line)> &on_line);
 }  // namespace korv
 #endif
 

@@ -163,10 +163,7 @@ int iscsi_conf_parse_access_right(const char *text)
 
 int iscsi_conf_generate_iqn(char *out, const char *first, const char *second)
 {
-    if (!out || !first || !second) {
-        DBG(0, "parameter error");
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(!out || !first || !second);
     out[0] = '\0';
     char prefix[CONF_GEN_IQN_LEN] = {};
     // An unset or unreadable prefix simply gives an unprefixed name.
@@ -177,10 +174,7 @@ int iscsi_conf_generate_iqn(char *out, const char *first, const char *second)
 
 int iscsi_conf_init(iscsi_conf_ctx_t *ctx)
 {
-    if (!ctx) {
-        DBG(0, "parameter error");
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(!ctx);
     ctx->ops = &iscsi_conf_ops;
     std::memset(ctx->host_name, 0, sizeof ctx->host_name);
     if (sys_net_get_host_name_in_iqn_spec(ctx->host_name, sizeof ctx->host_name, 1) != 0) {

@@ -6,7 +6,7 @@
  * stops at the first N whose key is empty, so entry N is visible only when
  * 1..N-1 all hold a key. Results: 0 success, -9989 parameter error, -9981
  * failure (also the generic one), -9980 not found, -9979 no room, -9990 /
- * -9992 passed up from the typed wrappers (config/korvadm_utils.h).
+ * -9992 passed up from the typed wrappers (config/korvadm_utils_db.h).
  *
  * Values under "/system_mgr" go through the platform's db* shortcuts, whose
  * results are ignored: they cannot fail here. Everything else goes through

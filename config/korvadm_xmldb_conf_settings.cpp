@@ -7,7 +7,7 @@
 #include <initializer_list>
 
 #include "common/korvadm_err.h"
-#include "config/korvadm_utils.h"
+#include "config/korvadm_utils_db.h"
 #include "config/korvadm_xmldb_conf_internal.h"
 #include "platform/platform_util.h"
 

@@ -3,7 +3,7 @@
 #include <cstring>
 
 #include "common/korvadm_err.h"
-#include "config/korvadm_utils.h"
+#include "config/korvadm_utils_db.h"
 #include "config/korvadm_xmldb_conf_internal.h"
 #include "platform/xmldbc.h"
 

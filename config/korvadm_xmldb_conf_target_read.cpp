@@ -2,7 +2,7 @@
 #include <cstdint>
 
 #include "common/korvadm_err.h"
-#include "config/korvadm_utils.h"
+#include "config/korvadm_utils_db.h"
 #include "config/korvadm_xmldb_conf_internal.h"
 
 using namespace xmldb_conf;

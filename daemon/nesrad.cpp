@@ -21,6 +21,7 @@
 #include "common/korvadm_debug.h"
 #include "common/korvadm_err.h"
 #include "common/korvadm_log.h"
+#include "common/korvadm_str.h"
 #include "common/korvadm_sys.h"
 #include "common/korvadm_utils.h"
 #include "isns/isns_transport.h"
@@ -37,11 +38,7 @@ unsigned g_poll_interval = NESRAD_POLL_INTERVAL;
 int g_registered;
 nesrad_node_t *g_iqn_head;
 
-// Copies src into dst[size] bounded, always NUL-terminated.
-void copy_bounded(char *dst, size_t size, const char *src)
-{
-    std::snprintf(dst, size, "%s", src ? src : "");
-}
+using korv::copy_bounded;
 
 }  // namespace
 
@@ -142,21 +139,16 @@ int init_iqn_list(void)
         copy_bounded(isns_entity_id, sizeof isns_entity_id, host);
     }
 
-    list_t targets;
-    list_init(&targets);
-    struct Release {
-        list_t *l;
-        ~Release() { target_conf_free_list(l); }
-    } release{&targets};
+    korv::list_owner targets(target_conf_free_list);
 
     const iscsi_conf_ops_t *ops = g_nesrad_conf.ops;
     if (!ops || !ops->xmldb_get_all_target_conf_lite ||
-        ops->xmldb_get_all_target_conf_lite(&targets) != 0) {
+        ops->xmldb_get_all_target_conf_lite(targets.get()) != 0) {
         DBG(0, "get target conf from config failed");
         return -1;
     }
     int count = 0;
-    for (target_conf_t *t : korv::list_records<target_conf_t>(&targets)) {
+    for (target_conf_t *t : korv::list_records<target_conf_t>(targets.get())) {
         if (iscsi_conf_generate_iqn(t->iqn, isns_entity_id, t->name) < 1) {
             DBG(0, "can not get IQN");
             return -1;
@@ -236,18 +228,13 @@ int get_iscsi_node_from_mod(isns_iscsi_node *node, const char *iqn, int tpgt)
     copy_bounded(node->name, sizeof node->name, iqn);
     node->pg_tag = static_cast<uint32_t>(tpgt);
 
-    list_t ips;
-    list_init(&ips);
-    struct Release {
-        list_t *l;
-        ~Release() { iscsi_ip_free_list(l); }
-    } release{&ips};
+    korv::list_owner ips(iscsi_ip_free_list);
 
-    if (iscsi_mod_get_target_ip_list_in_target_parm(&ips, iqn, tpgt) != 0) {
+    if (iscsi_mod_get_target_ip_list_in_target_parm(ips.get(), iqn, tpgt) != 0) {
         DBG(0, "can not get target ip");
         return -1;
     }
-    for (iscsi_ip_t *ip : korv::list_records<iscsi_ip_t>(&ips)) {
+    for (iscsi_ip_t *ip : korv::list_records<iscsi_ip_t>(ips.get())) {
         // A failed IPv4 half drops the whole entry, its IPv6 half included.
         if (ip->ipv4[0] && add_portal(node, ip->ipv4, ip->port, false) != portal_rc::added)
             continue;

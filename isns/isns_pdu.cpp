@@ -5,7 +5,7 @@
 #include <cstring>
 
 #include "common/korvadm_log.h"
-#include "isns/isns_client.h"
+#include "isns/isns_node.h"
 
 unsigned char isns_pdu_buf[ISNS_PDU_SIZE];
 int isns_trace = 0;

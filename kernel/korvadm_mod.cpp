@@ -6,6 +6,7 @@
 
 #include "common/korvadm_err.h"
 #include "common/korvadm_log.h"
+#include "common/korvadm_str.h"
 #include "kernel/korvadm_mod_lio4.h"
 
 const iscsi_mod_ops_t *iscsi_mod_ops = nullptr;
@@ -207,16 +208,16 @@ int iscsi_mod_get_target_ip_list_in_target_parm(list_t *ip_list, const char *tar
 {
     if (!ip_list || !target_iqn || !*target_iqn || tpgt < 0 || !iscsi_mod_ops)
         return ERR_PARAM;
-    if (std::strlen(target_iqn) >= ISCSI_TARGET_IQN_LEN) {
-        DBG(0, "target iqn is too long: %s", target_iqn);
-        return ERR_PARAM;
-    }
     iscsi_target_t *target = iscsi_target_new();
     if (!target) {
         DBG(0, "new iscsi_target_t failed");
         return ERR_NO_MEMORY;
     }
-    std::strcpy(target->iqn, target_iqn);
+    if (!korv::copy_bounded(target->iqn, target_iqn)) {
+        DBG(0, "target iqn is too long: %s", target_iqn);
+        iscsi_target_free(target);
+        return ERR_PARAM;
+    }
     target->tpgt = tpgt;
     int rc = iscsi_mod_get_target_ip_list(ip_list, target);
     iscsi_target_free(target);

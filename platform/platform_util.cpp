@@ -3,6 +3,7 @@
 #include "platform/platform_util.h"
 
 #include "common/korvadm_log.h"
+#include "common/korvadm_str.h"
 #include "common/korvadm_sysroot.h"
 #include "platform/xmldb_file.h"
 #include "platform/xmldbc.h"
@@ -137,23 +138,10 @@ int System(const char *fmt, ...)
 
 char *str_insert_back_slash(const char *src)
 {
-    if (!src)
+    std::string escaped;
+    if (!korv::shell_escape(src, escaped))
         return nullptr;
-    size_t extra = 0;
-    for (const char *p = src; *p; ++p)
-        extra += std::strchr("$\"\\`", *p) != nullptr;
-    size_t len = std::strlen(src);
-    auto *out = static_cast<char *>(std::malloc(len + extra + 1));
-    if (!out)
-        return nullptr;
-    char *o = out;
-    for (const char *p = src; *p; ++p) {
-        if (std::strchr("$\"\\`", *p))
-            *o++ = '\\';
-        *o++ = *p;
-    }
-    *o = '\0';
-    return out;
+    return strdup(escaped.c_str());
 }
 
 int str2ll(const char *str, long long *value)

@@ -8,7 +8,7 @@
 #include <gtest/gtest.h>
 
 #include "common/korvadm_err.h"
-#include "config/korvadm_utils.h"
+#include "config/korvadm_utils_db.h"
 #include "tests/config/store_fixture.h"
 #include "tests/support/capture.h"
 

@@ -9,7 +9,7 @@
 
 #include "common/korvadm_err.h"
 #include "common/korvadm_sys.h"
-#include "config/korvadm_utils.h"
+#include "config/korvadm_utils_db.h"
 #include "tests/config/store_fixture.h"
 #include "tests/support/capture.h"
 

@@ -5,8 +5,8 @@
  * A missing node and an empty one read alike: as "". Failures are logged here,
  * where they are detected, and returned as result codes (common/korvadm_err.h).
  * (The command, file and lock half of the layer is common/korvadm_utils.h.) */
-#ifndef CONFIG_KORVADM_UTILS_H
-#define CONFIG_KORVADM_UTILS_H
+#ifndef CONFIG_KORVADM_UTILS_DB_H
+#define CONFIG_KORVADM_UTILS_DB_H
 
 #include <stddef.h>
 #include <stdint.h>

@@ -1,5 +1,5 @@
 // Typed access to the configuration database and the number converters.
-#include "config/korvadm_utils.h"
+#include "config/korvadm_utils_db.h"
 
 #include <cerrno>
 #include <climits>
@@ -151,10 +151,7 @@ namespace {
 template <class T, class Parse>
 int convert_signed(const char *str, char **endptr, T *value, T lo, T hi, Parse parse)
 {
-    if (!str || !value) {
-        DBG(0, "ERR_PARAM_ERROR");
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(!str || !value, "ERR_PARAM_ERROR");
     char *local_end = nullptr;
     if (!endptr)
         endptr = &local_end;
@@ -198,10 +195,7 @@ int convert_dec_str_to_l(const char *str, char **endptr, long *value)
 
 int convert_str_to_uint64_t(const char *str, uint64_t *value)
 {
-    if (!str || !value) {
-        DBG(0, "ERR_PARAM_ERROR");
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(!str || !value, "ERR_PARAM_ERROR");
     char *end = nullptr;
     errno = 0;
     unsigned long long v = std::strtoull(str, &end, 10);
