@@ -49,10 +49,15 @@ void encode_request(std::string &out, Op op, std::string_view path, std::string_
     out.append(value);
 }
 
+void begin_answer(std::string &out, Status status, size_t data_size)
+{
+    put_be32(out, static_cast<uint32_t>(1 + data_size));
+    out.push_back(static_cast<char>(status));
+}
+
 void encode_answer(std::string &out, Status status, std::string_view data)
 {
-    put_be32(out, static_cast<uint32_t>(1 + data.size()));
-    out.push_back(static_cast<char>(status));
+    begin_answer(out, status, data.size());
     out.append(data);
 }
 

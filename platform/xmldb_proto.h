@@ -46,6 +46,8 @@ enum Status : uint8_t { kOk = 0, kFail = 1 };
 void encode_request(std::string &out, Op op, std::string_view path, std::string_view value);
 // Appends one answer frame to out.
 void encode_answer(std::string &out, Status status, std::string_view data);
+// Appends an answer's header only: the caller appends data_size bytes of data.
+void begin_answer(std::string &out, Status status, size_t data_size);
 
 struct Request {
     Op op;

@@ -39,31 +39,42 @@ bool is_plain_xml_name(std::string_view s)
     });
 }
 
-void escape_into(std::string &out, std::string_view v)
+// Out is a std::string, or a Counter when only the size is wanted.
+struct Counter {
+    size_t n = 0;
+    Counter &operator+=(std::string_view s) { n += s.size(); return *this; }
+    Counter &operator+=(char) { ++n; return *this; }
+};
+
+template <class Out>
+void escape_into(Out &out, std::string_view v)
 {
     static const char hex[] = "0123456789abcdef";
-    for (char c : v) {
-        auto u = static_cast<unsigned char>(c);
-        switch (c) {
+    size_t plain = 0;  // start of the run of bytes that go out as they are
+    for (size_t i = 0; i < v.size(); ++i) {
+        auto u = static_cast<unsigned char>(v[i]);
+        if (u >= 0x20 && u != 0x7f && u != '\\')
+            continue;
+        out += v.substr(plain, i - plain);
+        plain = i + 1;
+        switch (u) {
         case '\\': out += "\\\\"; break;
         case '\n': out += "\\n"; break;
         case '\r': out += "\\r"; break;
         case '\t': out += "\\t"; break;
         default:
-            if (u < 0x20 || u == 0x7f) {
-                out += "\\x";
-                out += hex[u >> 4];
-                out += hex[u & 15];
-            } else {
-                out += c;
-            }
+            out += "\\x";
+            out += hex[u >> 4];
+            out += hex[u & 15];
         }
     }
+    out += v.substr(plain);
 }
 
-void dump_node(std::string &out, std::string &path, const Tree::Node &n)
+template <class Out>
+void dump_node(Out &out, std::string &path, const Tree::Node &n)
 {
-    out += path.empty() ? "/" : path;
+    out += path.empty() ? std::string_view("/") : std::string_view(path);
     if (!n.value.empty()) {
         out += " = ";
         escape_into(out, n.value);
@@ -211,12 +222,12 @@ void Tree::del(std::string_view path)
     kids.erase(kids.begin() + (cur - kids.data()));
 }
 
-std::string Tree::dump(std::string_view path) const
+template <class Out>
+void Tree::dump_as(std::string_view path, Out &out) const
 {
-    std::string out;
     const Node *n = lookup(path);
     if (!n)
-        return out;
+        return;
     std::string p;
     for_each_segment(path, [&](std::string_view seg) {
         p += '/';
@@ -224,7 +235,18 @@ std::string Tree::dump(std::string_view path) const
         return true;
     });
     dump_node(out, p, *n);
-    return out;
+}
+
+void Tree::dump(std::string_view path, std::string &out) const
+{
+    dump_as(path, out);
+}
+
+size_t Tree::dump_size(std::string_view path) const
+{
+    Counter c;
+    dump_as(path, c);
+    return c.n;
 }
 
 std::string Tree::to_xml() const

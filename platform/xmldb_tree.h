@@ -34,7 +34,16 @@ public:
     void del(std::string_view path);
     // The subtree at path as text lines "<path> = <value>" (just "<path>" when
     // empty), parents before children; control bytes and '\' escaped C-style.
-    std::string dump(std::string_view path) const;
+    std::string dump(std::string_view path) const
+    {
+        std::string out;
+        dump(path, out);
+        return out;
+    }
+    // The same, appended to out; dump_size says how long it will be without
+    // building it.
+    void dump(std::string_view path, std::string &out) const;
+    size_t dump_size(std::string_view path) const;
 
     // The whole tree as an XML document.
     std::string to_xml() const;
@@ -53,6 +62,8 @@ public:
     };
 
 private:
+    template <class Out>
+    void dump_as(std::string_view path, Out &out) const;
     const Node *lookup(std::string_view path) const;
     Node root_;
 };

@@ -1,5 +1,7 @@
-// The client library against a real xmldbd: path semantics, buffers, saving,
-// and a service that is missing or restarts.
+// The client library against a real xmldbd: path semantics, buffers, saved
+// and loaded files, and a service that is missing or restarts.
+#include "platform/xmldb_client.h"
+#include "platform/xmldb_file.h"
 #include "platform/xmldbc.h"
 #include "tests/support/xmldbd_fixture.h"
 
@@ -8,6 +10,8 @@
 #include <cstring>
 #include <gtest/gtest.h>
 #include <string>
+#include <sys/stat.h>
+#include <unistd.h>
 
 using korv_test::SysRoot;
 using korv_test::XmldbService;
@@ -90,19 +94,47 @@ TEST(XmldbSemantics, LongValuesAreCutInTheCallersBufferAndBadArgumentsFail)
     EXPECT_EQ(get("/vols/vol:1/name"), "");
 }
 
-TEST(XmldbSave, WritesIntoTheConfigDirectoryOnlyAndReloads)
+// Saves hold CHAP secrets: they are private regular files, written only into
+// the allowed directories, through links never; loads take regular files of
+// at most 64 MiB and refuse anything else at once, the service serving on.
+TEST(XmldbFiles, SavedFilesArePrivateAndOnlyRegularFilesLoad)
 {
-    {
-        XmldbService db;
-        ASSERT_EQ(xmldbc_set(S, 0, "/iscsi/target/id:7/name", "seven"), 0);
-        ASSERT_EQ(xml_write_file("/etc/NAS_CFG/config.xml"), 0);
-        for (const char *outside :
-             {"/tmp/elsewhere.xml", "/etc/NAS_CFG/../escape.xml", "/etc/NAS_CFG/", "relative.xml"})
-            EXPECT_EQ(xml_write_file(outside), -1) << outside;
-        EXPECT_EQ(SysRoot::read("/escape.xml"), "");
+    XmldbService db;
+    const std::string cfg = "/etc/NAS_CFG/config.xml", linked = "/etc/NAS_CFG/linked.xml";
+    ASSERT_EQ(xmldbc_set(S, 0, "/iscsi/target/id:7/chap_pwd", "secret"), 0);
+    SysRoot::write(cfg, "<xmldb/>");
+    ::chmod(SysRoot::file(cfg).c_str(), 0644);
+    SysRoot::write("/outside.xml", "keep");
+    ::symlink(SysRoot::file("/outside.xml").c_str(), SysRoot::file(linked).c_str());
+    // Where the temporary used to go, named after the service's pid.
+    const std::string planted = SysRoot::file(cfg + ".tmp." + std::to_string(db.config().pid()));
+    ::symlink(SysRoot::file("/planted.xml").c_str(), planted.c_str());
+    for (const std::string &f : {cfg, linked}) {
+        ASSERT_EQ(xml_write_file(f.c_str()), 0) << f;
+        struct stat st{};
+        ASSERT_EQ(::lstat(SysRoot::file(f).c_str(), &st), 0);
+        EXPECT_TRUE(S_ISREG(st.st_mode)) << f;
+        EXPECT_EQ(st.st_mode & 07777, 0600u) << f;
+        EXPECT_NE(SysRoot::read(f).find("secret"), std::string::npos) << f;
     }
-    XmldbService db(false, SysRoot::file("/etc/NAS_CFG/config.xml"));
-    EXPECT_EQ(get("/iscsi/target/id:7/name"), "seven");
+    EXPECT_EQ(SysRoot::read("/outside.xml"), "keep");
+    EXPECT_NE(::access(SysRoot::file("/planted.xml").c_str(), F_OK), 0) << "a planted link was followed";
+    for (const char *outside : {"/tmp/elsewhere.xml", "/etc/NAS_CFG/../escape.xml", "/etc/NAS_CFG/", "relative.xml"})
+        EXPECT_EQ(xml_write_file(outside), -1) << outside;
+    EXPECT_EQ(SysRoot::read("/escape.xml"), "");
+
+    ::mkfifo(SysRoot::file("/etc/NAS_CFG/fifo.xml").c_str(), 0600);
+    ::truncate(SysRoot::file(cfg).c_str(), xmldb::kFileMax + 1);  // sparse
+    for (const std::string &f : {std::string("/dev/zero"), SysRoot::file("/etc/NAS_CFG/fifo.xml"),
+                                 SysRoot::file("/etc/NAS_CFG"), SysRoot::file(cfg)}) {
+        std::string why;
+        EXPECT_EQ(xmldb::call(SysRoot::file(S), xmldb::Op::Load, f, "", why), xmldb::CallResult::Refused) << f;
+        EXPECT_TRUE(why.find("regular") != std::string::npos || why.find("64 MiB") != std::string::npos) << why;
+        EXPECT_EQ(get("/iscsi/target/id:7/chap_pwd"), "secret") << f;
+    }
+    EXPECT_EQ(xml_write_file("/etc/NAS_CFG/fifo.xml"), -1);
+    struct stat st{};
+    EXPECT_TRUE(::stat(SysRoot::file("/etc/NAS_CFG/fifo.xml").c_str(), &st) == 0 && S_ISFIFO(st.st_mode));
 }
 
 TEST(XmldbAvailability, MissingOrStalledServiceFailsInBoundedTimeAndRestartIsPickedUp)

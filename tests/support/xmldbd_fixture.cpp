@@ -99,13 +99,15 @@ void SysRoot::remove(const std::string &abs)
 std::string xmldbd_binary() { return KORV_XMLDBD_PATH; }
 std::string xmldbc_binary() { return KORV_XMLDBC_PATH; }
 
-XmldbProcess::XmldbProcess(std::string socket, std::string load_file)
-    : socket_(std::move(socket)), load_(std::move(load_file))
+XmldbProcess::XmldbProcess(std::string socket, std::vector<std::string> options)
+    : socket_(std::move(socket)), options_(std::move(options))
 {
 }
 
 XmldbProcess::~XmldbProcess()
 {
+    if (ready_fd_ >= 0)
+        ::close(ready_fd_);
     stop();
 }
 
@@ -113,11 +115,22 @@ void XmldbProcess::start()
 {
     if (pid_ > 0)
         return;
-    std::string bin = xmldbd_binary(), load = load_;
-    std::vector<char *> argv = {bin.data(), const_cast<char *>("--socket"), socket_.data(),
-                                const_cast<char *>("--ready-fd"), const_cast<char *>("3")};
-    if (!load.empty())
-        argv.insert(argv.end(), {const_cast<char *>("--load"), load.data()});
+    spawn();
+    if (!ready()) {
+        kill();
+        throw std::runtime_error("xmldbd did not come up on " + socket_);
+    }
+}
+
+void XmldbProcess::spawn()
+{
+    if (pid_ > 0)
+        return;
+    std::vector<std::string> args = {xmldbd_binary(), "--socket", socket_, "--ready-fd", "3"};
+    args.insert(args.end(), options_.begin(), options_.end());
+    std::vector<char *> argv;
+    for (auto &a : args)
+        argv.push_back(a.data());
     argv.push_back(nullptr);
 
     int p[2];
@@ -138,14 +151,17 @@ void XmldbProcess::start()
     }
     ::close(p[1]);
     pid_ = pid;
-    pollfd pfd{p[0], POLLIN, 0};
+    ready_fd_ = p[0];
+}
+
+bool XmldbProcess::ready()
+{
+    pollfd pfd{ready_fd_, POLLIN, 0};
     char c = 0;
-    const ssize_t got = ::poll(&pfd, 1, 10000) > 0 ? ::read(p[0], &c, 1) : -1;
-    ::close(p[0]);
-    if (got != 1) {
-        kill();
-        throw std::runtime_error("xmldbd did not come up on " + socket_);
-    }
+    const ssize_t got = ::poll(&pfd, 1, 10000) > 0 ? ::read(ready_fd_, &c, 1) : -1;
+    ::close(ready_fd_);
+    ready_fd_ = -1;
+    return got == 1;
 }
 
 void XmldbProcess::kill()
@@ -175,7 +191,8 @@ int XmldbProcess::stop()
 }
 
 XmldbService::XmldbService(bool sysinfo, std::string load_file)
-    : config_(SysRoot::file(XMLDB_SOCK_ISCSI), std::move(load_file)),
+    : config_(SysRoot::file(XMLDB_SOCK_ISCSI),
+              load_file.empty() ? std::vector<std::string>{"--empty"} : std::vector<std::string>{"--load", load_file}),
       sysinfo_(SysRoot::file(XMLDB_SOCK_SYSINFO))
 {
     config_.start();

@@ -14,6 +14,7 @@
 
 #include <string>
 #include <sys/types.h>
+#include <vector>
 
 namespace korv_test {
 
@@ -41,10 +42,11 @@ std::string xmldbc_binary();
 // XmldbService's first argument: also serve "/var/run/xmldb_sock_sysinfo".
 inline constexpr bool kWithSysinfo = true;
 
-// One xmldbd process on a socket (a mapped path), ready when constructed.
+// One xmldbd process on a socket (a mapped path) with its command-line
+// options (by default an empty tree).
 class XmldbProcess {
 public:
-    XmldbProcess(std::string socket, std::string load_file = {});
+    explicit XmldbProcess(std::string socket, std::vector<std::string> options = {"--empty"});
     ~XmldbProcess();
     XmldbProcess(const XmldbProcess &) = delete;
     XmldbProcess &operator=(const XmldbProcess &) = delete;
@@ -52,6 +54,10 @@ public:
     // Starts the service (no-op when running); returns when it is serving.
     // Throws std::runtime_error when it does not come up within 10 s.
     void start();
+    // The same in two steps: spawn() returns at once, ready() waits up to
+    // 10 s and is false when the service exited (or hung) instead.
+    void spawn();
+    bool ready();
     // SIGTERM and wait; the service removes its socket. Returns its exit
     // status (128+N when killed by signal N, also after the 5 s grace
     // SIGKILL), or -1 when it was not running.
@@ -62,8 +68,9 @@ public:
 
 private:
     std::string socket_;
-    std::string load_;
+    std::vector<std::string> options_;
     pid_t pid_ = -1;
+    int ready_fd_ = -1;
 };
 
 // The configuration database service (and optionally the sysinfo one) in the
