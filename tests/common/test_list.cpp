@@ -149,4 +149,46 @@ TEST_F(ListTest, AddUniqueTellsSameRecordFromEqualKey)
     rec_free(twin);
 }
 
+void rec_free_list(list_t *l)
+{
+    list_release(l, rec_free);
+}
+
+TEST_F(ListTest, OwnerReleasesWhatItStillHoldsAndHandsOverInOrder)
+{
+    {
+        korv::list_owner owned(rec_free_list);
+        for (int i = 0; i < 3; ++i)
+            list_append(&rec_new(i)->node, owned.get());
+    }
+    EXPECT_EQ(g_freed, 3);
+
+    add(9);
+    korv::list_owner owned(rec_free_list);
+    for (int i = 0; i < 3; ++i)
+        list_append(&rec_new(i)->node, owned.get());
+    owned.hand_over(&list);
+    EXPECT_TRUE(list_is_empty(owned.get()));
+    EXPECT_EQ(keys(list), (std::vector<int>{9, 0, 1, 2}));
+    EXPECT_EQ(list.count, 4);
+    EXPECT_EQ(list.tail->list, &list);
+}
+
+TEST_F(ListTest, FillAndHandOverIsAllOrNothing)
+{
+    add(9);
+    auto fill = [](int rc) {
+        return [rc](list_t *got) {
+            list_append(&rec_new(1)->node, got);
+            list_append(&rec_new(2)->node, got);
+            return rc;
+        };
+    };
+    EXPECT_EQ(korv::fill_and_hand_over(&list, rec_free_list, fill(-9981)), -9981);
+    EXPECT_EQ(keys(list), (std::vector<int>{9}));
+    EXPECT_EQ(g_freed, 2);
+    EXPECT_EQ(korv::fill_and_hand_over(&list, rec_free_list, fill(0)), 0);
+    EXPECT_EQ(keys(list), (std::vector<int>{9, 1, 2}));
+}
+
 }  // namespace

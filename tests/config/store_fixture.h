@@ -12,18 +12,6 @@
 
 namespace korv_test {
 
-// fn()'s result, with the log lines it prints kept out of the test's output
-// (and handed back in *out when asked for).
-template <class Fn>
-auto quiet(Fn fn, std::string *out = nullptr)
-{
-    decltype(fn()) result{};
-    std::string text = capture_stdout([&] { result = fn(); });
-    if (out)
-        *out = std::move(text);
-    return result;
-}
-
 class StoreTest : public ::testing::Test {
 protected:
     // Raw value at path ("" when absent); fails the test when the service does not answer.

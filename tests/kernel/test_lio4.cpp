@@ -18,21 +18,21 @@
 #include <gtest/gtest.h>
 
 #include "common/korvadm_err.h"
-#include "tests/kernel/kernel_root.h"
+#include "tests/support/sysroot.h"
 #include "tests/support/capture.h"
 
 namespace {
 
 using korv_test::capture_stdout;
-using korv_test::KernelRoot;
+using korv_test::SysRootTest;
 
 const char *const IQN = "iqn.2026-01.test:t1";
 
-class Lio4Test : public KernelRoot {
+class Lio4Test : public SysRootTest {
 protected:
     void SetUp() override
     {
-        KernelRoot::SetUp();
+        SysRootTest::SetUp();
         t = iscsi_target_new();
         std::strcpy(t->iqn, IQN);
         t->tpgt = 1;
@@ -40,7 +40,7 @@ protected:
     void TearDown() override
     {
         iscsi_target_free(t);
-        KernelRoot::TearDown();
+        SysRootTest::TearDown();
     }
     std::string tpg() { return at("/sys/kernel/config/target/iscsi/") + IQN + "/tpgt_1"; }
     iscsi_target_t *t = nullptr;

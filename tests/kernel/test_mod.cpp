@@ -8,11 +8,11 @@
 
 #include "common/korvadm_err.h"
 #include "kernel/korvadm_mod_lio4.h"
-#include "tests/kernel/kernel_root.h"
+#include "tests/support/sysroot.h"
 
 namespace {
 
-using korv_test::KernelRoot;
+using korv_test::SysRootTest;
 
 // The last call that reached the recording table: slot and arguments.
 struct call {
@@ -40,11 +40,11 @@ iscsi_mod_ops_t recording_table()
     return t;
 }
 
-class ModTest : public KernelRoot {
+class ModTest : public SysRootTest {
 protected:
     void SetUp() override
     {
-        KernelRoot::SetUp();
+        SysRootTest::SetUp();
         saved_ = iscsi_mod_ops;
         rec = call{};
         list_init(&list_);
@@ -52,7 +52,7 @@ protected:
     void TearDown() override
     {
         iscsi_mod_ops = saved_;
-        KernelRoot::TearDown();
+        SysRootTest::TearDown();
     }
     const iscsi_mod_ops_t *saved_ = nullptr;
     iscsi_target_t target_{};

@@ -1,7 +1,6 @@
-// Temporary system roots and real xmldbd processes for tests.
+// Real xmldbd processes for tests.
 #include "tests/support/xmldbd_fixture.h"
 
-#include "common/korvadm_sysroot.h"
 #include "platform/xmldbc.h"
 
 #include <cerrno>
@@ -10,9 +9,6 @@
 #include <cstdlib>
 #include <cstring>
 #include <fcntl.h>
-#include <filesystem>
-#include <fstream>
-#include <iterator>
 #include <poll.h>
 #include <stdexcept>
 #include <sys/prctl.h>
@@ -28,73 +24,6 @@
 #endif
 
 namespace korv_test {
-
-namespace fs = std::filesystem;
-
-namespace {
-
-pid_t g_root_owner = 0;
-std::error_code ec_ignored;  // a test's files may already be gone
-
-void remove_root_at_exit()
-{
-    // Forked children exit through here too: only the creator cleans up.
-    if (::getpid() == g_root_owner)
-        fs::remove_all(SysRoot::path(), ec_ignored);
-}
-
-}  // namespace
-
-const std::string &SysRoot::path()
-{
-    // Leaked on purpose: the exit handler below needs it after static destructors.
-    static const std::string &root = *new std::string([] {
-        char tmpl[] = "/tmp/korv-root-XXXXXX";
-        if (!::mkdtemp(tmpl)) {
-            std::perror("mkdtemp");
-            std::abort();
-        }
-        std::string r = tmpl;
-        ::setenv(KORV_SYSROOT_ENV, r.c_str(), 1);
-        if (r != sysroot_prefix()) {
-            std::fprintf(stderr, "SysRoot: the system root was read before the test set it (\"%s\")\n",
-                         sysroot_prefix());
-            std::abort();
-        }
-        g_root_owner = ::getpid();
-        std::atexit(remove_root_at_exit);
-        return r;
-    }());
-    return root;
-}
-
-std::string SysRoot::file(const std::string &abs)
-{
-    return path() + abs;
-}
-
-void SysRoot::mkdirs(const std::string &abs)
-{
-    fs::create_directories(file(abs), ec_ignored);
-}
-
-void SysRoot::write(const std::string &abs, const std::string &content)
-{
-    const fs::path f = file(abs);
-    fs::create_directories(f.parent_path(), ec_ignored);
-    std::ofstream(f, std::ios::binary | std::ios::trunc) << content;
-}
-
-std::string SysRoot::read(const std::string &abs)
-{
-    std::ifstream in(file(abs), std::ios::binary);
-    return {std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>()};
-}
-
-void SysRoot::remove(const std::string &abs)
-{
-    fs::remove_all(file(abs), ec_ignored);
-}
 
 std::string xmldbd_binary() { return KORV_XMLDBD_PATH; }
 std::string xmldbc_binary() { return KORV_XMLDBC_PATH; }

@@ -1,39 +1,19 @@
-// Test support: a private system root per test process, and real xmldbd
-// services serving the configuration (and system-information) databases in it.
+// Real xmldbd services serving the configuration (and system-information)
+// databases in the test process's system root (sysroot.h).
 //
-//   korv_test::SysRoot::path()        the root (created on first use)
 //   korv_test::XmldbService db;       configuration database, empty tree
 //   korv_test::XmldbService db(korv_test::kWithSysinfo);   plus the sysinfo database
 //
-// The root is a mkdtemp directory, exported as NESRAD_SYSROOT before the
-// library reads it (the library reads it once per process). When one process
-// runs several test cases the root is shared; XmldbService still starts each
-// service with an empty tree. Make sure SysRoot::path() (or an XmldbService)
-// comes before any code that maps a system path, e.g. at the top of the test.
+// Each service starts with an empty tree, also when test cases share the root.
 #pragma once
 
 #include <string>
 #include <sys/types.h>
 #include <vector>
 
-namespace korv_test {
+#include "tests/support/sysroot.h"
 
-class SysRoot {
-public:
-    // The root directory, created and exported on first use. Fails the
-    // process loudly if the library had already read another root.
-    static const std::string &path();
-    // root + abs (abs starts with '/').
-    static std::string file(const std::string &abs);
-    // Writes content to root + abs, creating parent directories.
-    static void write(const std::string &abs, const std::string &content);
-    // Contents of root + abs ("" when unreadable).
-    static std::string read(const std::string &abs);
-    // Creates root + abs and its parents as directories.
-    static void mkdirs(const std::string &abs);
-    // Removes root + abs recursively (nothing when absent).
-    static void remove(const std::string &abs);
-};
+namespace korv_test {
 
 // Path of the built xmldbd and xmldbc executables.
 std::string xmldbd_binary();

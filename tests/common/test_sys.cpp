@@ -9,12 +9,11 @@
 
 #include "common/korvadm_err.h"
 #include "common/korvadm_sys.h"
-#include "config/korvadm_utils_db.h"
-#include "tests/config/store_fixture.h"
+#include "platform/xmldbc.h"
 #include "tests/support/capture.h"
+#include "tests/support/xmldbd_fixture.h"
 
 using korv_test::quiet;
-using korv_test::StoreTest;
 using korv_test::SysRoot;
 
 TEST(AddressEntries, SearchCompareAndFree)
@@ -106,16 +105,15 @@ void link(int port, bool up)
 
 }  // namespace
 
-using NetList = StoreTest;
-
-TEST_F(NetList, LinkStateBondingAndIpv6ModesChooseTheEntriesAppendedToTheList)
+TEST(NetList, LinkStateBondingAndIpv6ModesChooseTheEntriesAppendedToTheList)
 {
+    korv_test::XmldbService db;
     EXPECT_EQ(quiet([&] { return sys_net_get_ip_list(nullptr); }), ERR_PARAM);
     for (const NetCase &c : kNetCases) {
-        xmldb_delete_node("/network_mgr");
+        xmldbc_del(XMLDB_SOCK_ISCSI, 0, "/network_mgr");
         for (const Settings *s : {&kStored, &c.settings})
             for (const auto &[key, value] : *s)
-                put("/network_mgr/" + key, value);
+                ASSERT_EQ(xmldbc_set(XMLDB_SOCK_ISCSI, 0, ("/network_mgr/" + key).c_str(), value.c_str()), 0);
         link(0, c.up0);
         link(1, c.up1);
         list_t list;

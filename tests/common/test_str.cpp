@@ -1,0 +1,76 @@
+// The shared text helpers: the bounded copy, the shell escaping, and the
+// argument guard.
+#include "common/korvadm_str.h"
+
+#include <cstring>
+
+#include <gtest/gtest.h>
+
+#include "common/korvadm_err.h"
+#include "tests/support/capture.h"
+
+namespace {
+
+TEST(CopyBounded, CutsTerminatesAndSaysWhetherAllFitted)
+{
+    struct {
+        const char *src;
+        const char *want;
+        bool fitted;
+    } cases[] = {{"abc", "abc", true}, {"abcd", "abc", false}, {"", "", true}, {nullptr, "", true}};
+    for (const auto &c : cases) {
+        char dst[4];
+        std::memset(dst, 'x', sizeof dst);
+        EXPECT_EQ(korv::copy_bounded(dst, c.src), c.fitted) << (c.src ? c.src : "NULL");
+        EXPECT_STREQ(dst, c.want);
+    }
+    char none[1] = {'x'};
+    EXPECT_FALSE(korv::copy_bounded(none, 0, "a"));
+    EXPECT_EQ(none[0], 'x');
+}
+
+TEST(CopyBounded, NeverReadsPastAFieldThatLacksItsTerminator)
+{
+    struct {
+        char field[4];
+        char guard[4];
+    } rec;
+    std::memcpy(rec.field, "wxyz", 4);
+    std::memcpy(rec.guard, "BAD", 4);
+    char dst[4];
+    EXPECT_FALSE(korv::copy_bounded(dst, rec.field));
+    EXPECT_STREQ(dst, "wxy");
+    EXPECT_EQ(korv::field_str(rec.field), "wxyz");
+}
+
+TEST(ShellEscape, BackslashesExactlyTheCharactersLiveInDoubleQuotes)
+{
+    EXPECT_EQ(korv::shell_escape(std::string_view("a$b\"c\\d`e 'f' ;|&")), "a\\$b\\\"c\\\\d\\`e 'f' ;|&");
+    std::string out = "kept";
+    EXPECT_FALSE(korv::shell_escape(nullptr, out));
+    EXPECT_EQ(out, "kept");
+    EXPECT_TRUE(korv::shell_escape("$(id)", out));
+    EXPECT_EQ(out, "\\$(id)");
+}
+
+int guarded(const char *name, int n)
+{
+    PARAM_GUARD(!name);
+    PARAM_GUARD(n < 0, "bad n = %d", n);
+    return 0;
+}
+
+TEST(ParamGuard, LogsUnderTheOperationAndAnswersParameterError)
+{
+    int rc = 0;
+    std::string out = korv_test::capture_stdout([&] { rc = guarded(nullptr, 1); });
+    EXPECT_EQ(rc, ERR_PARAM);
+    EXPECT_NE(out.find(":guarded:"), std::string::npos) << out;
+    EXPECT_NE(out.find("parameter error\n"), std::string::npos) << out;
+    out = korv_test::capture_stdout([&] { rc = guarded("t", -2); });
+    EXPECT_EQ(rc, ERR_PARAM);
+    EXPECT_NE(out.find("bad n = -2\n"), std::string::npos) << out;
+    EXPECT_EQ(guarded("t", 0), 0);
+}
+
+}  // namespace

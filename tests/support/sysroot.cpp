@@ -1,0 +1,95 @@
+// The temporary system root shared by every test of a process.
+#include "tests/support/sysroot.h"
+
+#include <unistd.h>
+
+#include <cstdio>
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <iterator>
+
+#include "common/korvadm_log.h"
+#include "common/korvadm_sysroot.h"
+
+namespace korv_test {
+
+namespace fs = std::filesystem;
+
+namespace {
+pid_t g_root_owner = 0;
+std::error_code ec_ignored;  // a test's files may already be gone
+
+void mkdirs_at(const std::string &path) { fs::create_directories(path, ec_ignored); }
+
+void write_at(const std::string &path, const std::string &text)
+{
+    mkdirs_at(fs::path(path).parent_path());
+    std::ofstream(path, std::ios::binary | std::ios::trunc) << text;
+}
+
+std::string read_at(const std::string &path)
+{
+    std::ifstream in(path, std::ios::binary);
+    return {std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>()};
+}
+
+void remove_root_at_exit()
+{
+    // Forked children exit through here too: only the creator cleans up.
+    if (::getpid() == g_root_owner)
+        fs::remove_all(SysRoot::path(), ec_ignored);
+}
+}  // namespace
+
+const std::string &SysRoot::path()
+{
+    // Leaked on purpose: the exit handler below needs it after static destructors.
+    static const std::string &root = *new std::string([] {
+        char tmpl[] = "/tmp/korv-root-XXXXXX";
+        if (!::mkdtemp(tmpl)) {
+            std::perror("mkdtemp");
+            std::abort();
+        }
+        std::string r = tmpl;
+        ::setenv(KORV_SYSROOT_ENV, r.c_str(), 1);
+        if (r != sysroot_prefix()) {
+            std::fprintf(stderr, "SysRoot: the system root was read before the test set it (\"%s\")\n",
+                         sysroot_prefix());
+            std::abort();
+        }
+        g_root_owner = ::getpid();
+        std::atexit(remove_root_at_exit);
+        return r;
+    }());
+    return root;
+}
+
+std::string SysRoot::file(const std::string &abs) { return path() + abs; }
+void SysRoot::write(const std::string &abs, const std::string &content) { write_at(file(abs), content); }
+std::string SysRoot::read(const std::string &abs) { return read_at(file(abs)); }
+void SysRoot::mkdirs(const std::string &abs) { mkdirs_at(file(abs)); }
+void SysRoot::remove(const std::string &abs) { fs::remove_all(file(abs), ec_ignored); }
+
+void SysRoot::clear()
+{
+    for (const auto &entry : fs::directory_iterator(path(), ec_ignored))
+        fs::remove_all(entry.path(), ec_ignored);
+}
+
+void SysRootTest::SetUp()
+{
+    SysRoot::clear();
+    g_korv_debug_level = 0;
+}
+
+void SysRootTest::mkdirs(const std::string &path) { mkdirs_at(path); }
+void SysRootTest::write_file(const std::string &path, const std::string &text) { write_at(path, text); }
+std::string SysRootTest::read_file(const std::string &path) { return read_at(path); }
+
+bool SysRootTest::exists(const std::string &path)
+{
+    return fs::exists(fs::symlink_status(path, ec_ignored));
+}
+
+}  // namespace korv_test
