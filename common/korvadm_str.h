@@ -11,6 +11,7 @@
 
 #ifdef __cplusplus
 #include <cstdlib>
+#include <cstring>
 #include <memory>
 #include <string>
 #include <string_view>
