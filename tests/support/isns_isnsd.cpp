@@ -1,7 +1,5 @@
 #include "tests/support/isns_isnsd.h"
 
-#include <signal.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <chrono>
@@ -51,7 +49,7 @@ bool isnsd_server::start()
 {
     if (dir_.empty())
         return false;
-    if (pid_ > 0)
+    if (proc_.pid() > 0)
         return true;
     if (tcp_port_open(address_, 3205)) {
         error_ = "port 3205 on " + address_ + " is already held by another server";
@@ -72,27 +70,18 @@ bool isnsd_server::start()
             << "ControlSocket = " << dir_ << "/isnsctl\n"
             << "Security = 0\n";
     }
-    const std::string isnsd = find_tool("isnsd"), conf = dir_ + "/isnsd.conf", log = dir_ + "/isnsd.log";
-    std::fflush(nullptr);
-    pid_t pid = fork();
-    if (pid == 0) {
-        FILE *out = std::freopen(log.c_str(), "a", stdout);
-        if (out)
-            dup2(fileno(out), STDERR_FILENO);
-        execl(isnsd.c_str(), "isnsd", "-f", "-c", conf.c_str(), static_cast<char *>(nullptr));
-        _exit(127);
-    }
-    if (pid < 0) {
+    const std::string conf = dir_ + "/isnsd.conf", log = dir_ + "/isnsd.log";
+    if (!proc_.start({find_tool("isnsd"), "-f", "-c", conf}, [&] {
+            if (FILE *out = std::freopen(log.c_str(), "a", stdout))
+                dup2(fileno(out), STDERR_FILENO);
+        })) {
         error_ = "fork failed";
         return false;
     }
-    pid_ = pid;
     for (int i = 0; i < 1000; i++) {  // about 5 s
-        if (waitpid(pid_, nullptr, WNOHANG) == pid_) {
-            pid_ = -1;
+        if (!proc_.running()) {
             std::ifstream in(log);
-            std::string text((std::istreambuf_iterator<char>(in)), std::istreambuf_iterator<char>());
-            error_ = "isnsd exited at start: " + text;
+            error_ = "isnsd exited at start: " + std::string(std::istreambuf_iterator<char>(in), {});
             return false;
         }
         if (tcp_port_open(address_, 3205) && access((dir_ + "/isnsctl").c_str(), F_OK) == 0)
@@ -106,19 +95,8 @@ bool isnsd_server::start()
 
 void isnsd_server::stop()
 {
-    if (pid_ <= 0)
+    if (proc_.stop() < 0)
         return;
-    kill(pid_, SIGTERM);
-    // A server that ignores SIGTERM must not hang the test.
-    for (int i = 0; waitpid(pid_, nullptr, WNOHANG) == 0; i++) {
-        if (i == 2500) {
-            kill(pid_, SIGKILL);
-            waitpid(pid_, nullptr, 0);
-            break;
-        }
-        std::this_thread::sleep_for(std::chrono::milliseconds(2));
-    }
-    pid_ = -1;
     unlink((dir_ + "/isnsd.pid").c_str());
     unlink((dir_ + "/isnsctl").c_str());
 }

@@ -18,7 +18,8 @@
 #pragma once
 
 #include <string>
-#include <sys/types.h>
+
+#include "tests/support/process.h"
 
 namespace korv_test {
 
@@ -49,7 +50,7 @@ private:
     std::string address_;
     std::string dir_;
     std::string error_;
-    pid_t pid_ = -1;
+    child_process proc_;
 };
 
 }  // namespace korv_test

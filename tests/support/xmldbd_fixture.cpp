@@ -4,15 +4,10 @@
 #include "platform/xmldbc.h"
 
 #include <cerrno>
-#include <csignal>
-#include <cstdio>
-#include <cstdlib>
 #include <cstring>
 #include <fcntl.h>
 #include <poll.h>
 #include <stdexcept>
-#include <sys/prctl.h>
-#include <sys/wait.h>
 #include <unistd.h>
 #include <vector>
 
@@ -42,7 +37,7 @@ XmldbProcess::~XmldbProcess()
 
 void XmldbProcess::start()
 {
-    if (pid_ > 0)
+    if (pid() > 0)
         return;
     spawn();
     if (!ready()) {
@@ -53,33 +48,20 @@ void XmldbProcess::start()
 
 void XmldbProcess::spawn()
 {
-    if (pid_ > 0)
+    if (pid() > 0)
         return;
     std::vector<std::string> args = {xmldbd_binary(), "--socket", socket_, "--ready-fd", "3"};
     args.insert(args.end(), options_.begin(), options_.end());
-    std::vector<char *> argv;
-    for (auto &a : args)
-        argv.push_back(a.data());
-    argv.push_back(nullptr);
-
     int p[2];
     if (::pipe2(p, O_CLOEXEC) != 0)
         throw std::runtime_error("pipe: " + std::string(std::strerror(errno)));
-    const pid_t parent = ::getpid(), pid = ::fork();
-    if (pid == 0) {
-        // Never outlive the test that started us.
-        ::prctl(PR_SET_PDEATHSIG, SIGKILL);
-        if (::getppid() != parent)
-            ::_exit(127);
+    proc_.start(args, [&] {
         if (p[1] == 3)
             ::fcntl(3, F_SETFD, 0);
         else
             ::dup2(p[1], 3);
-        ::execv(argv[0], argv.data());
-        ::_exit(127);
-    }
+    });
     ::close(p[1]);
-    pid_ = pid;
     ready_fd_ = p[0];
 }
 
@@ -93,31 +75,8 @@ bool XmldbProcess::ready()
     return got == 1;
 }
 
-void XmldbProcess::kill()
-{
-    if (pid_ <= 0)
-        return;
-    ::kill(pid_, SIGKILL);
-    ::waitpid(pid_, nullptr, 0);
-    pid_ = -1;
-}
-
-int XmldbProcess::stop()
-{
-    if (pid_ <= 0)
-        return -1;
-    ::kill(pid_, SIGTERM);
-    int st = 0;
-    for (int i = 0; ::waitpid(pid_, &st, WNOHANG) == 0; ++i) {
-        if (i == 2500) {  // about 5 s: a hung service must not hang the test
-            kill();
-            return 128 + SIGKILL;
-        }
-        ::usleep(2000);
-    }
-    pid_ = -1;
-    return WIFEXITED(st) ? WEXITSTATUS(st) : 128 + WTERMSIG(st);
-}
+void XmldbProcess::kill() { proc_.kill(); }
+int XmldbProcess::stop() { return proc_.stop(); }
 
 XmldbService::XmldbService(bool sysinfo, std::string load_file)
     : config_(SysRoot::file(XMLDB_SOCK_ISCSI),

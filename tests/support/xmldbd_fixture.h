@@ -11,6 +11,7 @@
 #include <sys/types.h>
 #include <vector>
 
+#include "tests/support/process.h"
 #include "tests/support/sysroot.h"
 
 namespace korv_test {
@@ -44,12 +45,12 @@ public:
     int stop();
     // SIGKILL and reap, as a crash would: the socket stays behind.
     void kill();
-    pid_t pid() const { return pid_; }
+    pid_t pid() const { return proc_.pid(); }
 
 private:
     std::string socket_;
     std::vector<std::string> options_;
-    pid_t pid_ = -1;
+    child_process proc_;
     int ready_fd_ = -1;
 };
 
