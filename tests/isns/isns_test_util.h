@@ -3,9 +3,11 @@
 
 #include <arpa/inet.h>
 #include <cstring>
+#include <memory>
 #include <string>
 
 #include "common/korvadm_err.h"
+#include "common/korvadm_str.h"
 #include "isns/isns_client.h"
 #include "isns/isns_pdu.h"
 #include "isns/isns_transport.h"
@@ -17,12 +19,13 @@ namespace isns_test {
 // The test server, its byte builders and + on byte vectors.
 using namespace korv_test;
 
-inline void reset_client(const char *server, int family = AF_INET)
+inline void reset_client(const char *server, int family = AF_INET, const char *source = "")
 {
-    std::snprintf(isns_server_addr, sizeof isns_server_addr, "%s", server);
+    korv::copy_bounded(isns_server_addr, server);
     isns_addr_family = family;
-    std::snprintf(isns_entity_id, sizeof isns_entity_id, "nas1");
+    korv::copy_bounded(isns_entity_id, "nas1");
     std::memset(isns_entity_name, 0, sizeof isns_entity_name);
+    korv::copy_bounded(isns_entity_name, source);
     isns_trace = 0;
     isns_alias_on = 0;
 }
@@ -39,7 +42,7 @@ inline isns_iscsi_node *make_node(const char *name, uint32_t tag, std::initializ
                                   uint32_t port = 3260)
 {
     isns_iscsi_node *n = isns_iscsi_node_new();
-    std::snprintf(n->name, sizeof n->name, "%s", name);
+    korv::copy_bounded(n->name, name);
     n->pg_tag = tag;
     for (const char *a : addrs) {
         isns_ip_portal *p = isns_ip_portal_new();
@@ -56,6 +59,17 @@ inline bytes status_rsp(uint32_t status, uint16_t func = 0x8002)
                                    static_cast<uint8_t>(status >> 8), static_cast<uint8_t>(status)});
 }
 
+// A scripted server on address answering every connection with reply, and
+// the client pointed at it with `source` as the source name.
+inline std::unique_ptr<isns_fake_server> fake_at(const char *address, isns_fake_reply reply, const char *source = "")
+{
+    auto srv = std::make_unique<isns_fake_server>(address);
+    EXPECT_TRUE(srv->ok()) << srv->error();
+    srv->set_reply(std::move(reply));
+    reset_client(address, AF_INET, source);
+    return srv;
+}
+
 // A fresh isnsd named srv on address (skips when isnsd is not installed),
 // with the client pointed at it and `source` as the source name.
 #define START_ISNSD(srv, address, family, source)                                              \
@@ -63,7 +77,6 @@ inline bytes status_rsp(uint32_t status, uint16_t func = 0x8002)
         GTEST_SKIP() << "isnsd/isnsadm not installed (open-isns-server, open-isns-utils)";     \
     isns_test::isnsd_server srv(address);                                                      \
     ASSERT_TRUE(srv.start()) << srv.error();                                                   \
-    isns_test::reset_client(address, family);                                                  \
-    std::snprintf(isns_entity_name, sizeof isns_entity_name, "%s", source)
+    isns_test::reset_client(address, family, source)
 
 }  // namespace isns_test

@@ -24,13 +24,9 @@ bytes addr16(const char *text)
 template <class Op>
 bytes request_of(const char *server, Op op)
 {
-    isns_fake_server srv(server);
-    EXPECT_TRUE(srv.ok()) << srv.error();
-    srv.set_reply({status_rsp(0, 0x8001), 0, 0, 0});
-    reset_client(server);
-    std::snprintf(isns_entity_name, sizeof isns_entity_name, "iqn.x:t1");
+    auto srv = fake_at(server, {status_rsp(0, 0x8001)}, "iqn.x:t1");
     EXPECT_EQ(op(), 0);
-    auto reqs = srv.requests();
+    auto reqs = srv->requests();
     return reqs.size() == 1 ? reqs[0] : bytes{};
 }
 
@@ -101,10 +97,7 @@ TEST(IsnsEncoding, PortallessNodeLosesItsTypeAndQueryAsksForTargetNames)
 
 TEST(IsnsEncoding, MessageThatDoesNotFitIsNeverSent)
 {
-    isns_fake_server srv("127.10.1.6");
-    ASSERT_TRUE(srv.ok()) << srv.error();
-    srv.set_reply({status_rsp(0, 0x8001), 0, 0, 0});
-    reset_client("127.10.1.6");
+    auto srv = fake_at("127.10.1.6", {status_rsp(0, 0x8001)});
     isns_iscsi_node *n = make_node("iqn.x:t1", 1, {});
     for (int i = 0; i < 400; i++) {  // 400 portals: 44 + 52 bytes each, far past the buffer
         isns_ip_portal *p = isns_ip_portal_new();
@@ -114,7 +107,7 @@ TEST(IsnsEncoding, MessageThatDoesNotFitIsNeverSent)
     const std::string out = capture_stdout([n] { EXPECT_EQ(register_entity(n), -1); });
     EXPECT_NE(out.find("10000"), std::string::npos) << out;
     EXPECT_LE(isns_pdu_len(), size_t{ISNS_PDU_SIZE});
-    EXPECT_TRUE(srv.requests().empty());
+    EXPECT_TRUE(srv->requests().empty());
 
     // A long alias alone overflows as well; the next message is whole again.
     isns_alias_on = 1;
@@ -122,10 +115,10 @@ TEST(IsnsEncoding, MessageThatDoesNotFitIsNeverSent)
     isns_alias[sizeof isns_alias - 1] = '\0';
     isns_iscsi_node *small = make_node("iqn.x:t2", 1, {"10.0.0.1"});
     capture_stdout([small] { EXPECT_EQ(register_node(small), -1); });
-    EXPECT_TRUE(srv.requests().empty());
+    EXPECT_TRUE(srv->requests().empty());
     isns_alias_on = 0;
     EXPECT_EQ(register_node(small), 0);
-    EXPECT_EQ(srv.requests().size(), 1u);
+    EXPECT_EQ(srv->requests().size(), 1u);
     isns_iscsi_node_free(small);
     isns_iscsi_node_free(n);
 }

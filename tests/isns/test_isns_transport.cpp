@@ -25,11 +25,7 @@ struct check_result {
 // Serves one scripted reply on `server` and runs the check for kName.
 check_result check_against(const char *server, const isns_fake_reply &reply)
 {
-    isns_fake_server srv(server);
-    EXPECT_TRUE(srv.ok()) << srv.error();
-    srv.set_reply(reply);
-    reset_client(server);
-    std::snprintf(isns_entity_name, sizeof isns_entity_name, "%s", kName);
+    auto srv = fake_at(server, reply, kName);
     const auto t0 = std::chrono::steady_clock::now();
     const int rc = isns_check_registration(kName);
     return {rc, std::chrono::duration<double>(std::chrono::steady_clock::now() - t0).count()};
@@ -93,10 +89,7 @@ TEST(IsnsReceive, MultiPduResponsesAreJoinedUpToTheBuffer)
     };
     const bytes payload = isns_query_rsp(0, kName, {"iqn.a", "iqn.b", kName});
     {
-        isns_fake_server srv("127.10.2.5");
-        ASSERT_TRUE(srv.ok()) << srv.error();
-        srv.set_reply(whole(split3(payload)));
-        reset_client("127.10.2.5");
+        auto srv = fake_at("127.10.2.5", whole(split3(payload)));
         emit_hdr(2);
         EXPECT_EQ(send_and_recv(), static_cast<int>(payload.size()));
         EXPECT_EQ(bytes(isns_pdu_buf, isns_pdu_buf + payload.size()), payload);
@@ -110,10 +103,7 @@ TEST(IsnsReceive, MultiPduResponsesAreJoinedUpToTheBuffer)
 
 TEST(IsnsReceive, StatusStaysReadableAfterFailure)
 {
-    isns_fake_server srv("127.10.2.7");
-    ASSERT_TRUE(srv.ok()) << srv.error();
-    srv.set_reply(whole(status_rsp(6)));
-    reset_client("127.10.2.7");
+    auto srv = fake_at("127.10.2.7", whole(status_rsp(6)));
     // Without its trace the transport prints nothing, whatever the debug
     // level: a refused status and an unreachable server alike.
     const int level = g_korv_debug_level;
@@ -122,7 +112,7 @@ TEST(IsnsReceive, StatusStaysReadableAfterFailure)
         emit_hdr(2);
         EXPECT_EQ(send_and_recv(), -1);
         EXPECT_EQ(isns_last_status, 6);
-        std::snprintf(isns_server_addr, sizeof isns_server_addr, "127.10.2.8");
+        korv::copy_bounded(isns_server_addr, "127.10.2.8");
         emit_hdr(2);
         EXPECT_EQ(send_and_recv(), -1);
         EXPECT_EQ(isns_last_status, 0);
@@ -196,9 +186,7 @@ TEST(IsnsTimeLimits, UnreachableServerFailsWithinTheConnectTimeout)
 
 TEST(IsnsConnect, AddressTextMustParseForItsFamily)
 {
-    isns_fake_server srv("127.10.3.4");
-    ASSERT_TRUE(srv.ok()) << srv.error();
-    srv.set_reply(whole(qry_rsp({kName})));
+    auto srv = fake_at("127.10.3.4", whole(qry_rsp({kName})));
     int fd = -1;
     for (auto [family, text] : {std::pair{AF_INET, ""}, {AF_INET, "nas.example"}, {AF_INET, "::1"},
                                 {AF_INET6, "127.10.3.4"}, {AF_UNIX, "127.10.3.4"}})
