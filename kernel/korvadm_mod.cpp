@@ -52,6 +52,60 @@ void iscsi_lun_free(iscsi_lun_t *lun)
     std::free(lun);
 }
 
+namespace {
+// A zeroed record of type T with its list node owned by itself.
+template <class T>
+T *new_record()
+{
+    auto *r = static_cast<T *>(std::calloc(1, sizeof(T)));
+    if (r)
+        list_node_init(&r->node, r);
+    return r;
+}
+
+template <class T>
+void free_record(T *r)
+{
+    if (!r)
+        return;
+    list_remove(&r->node);
+    std::free(r);
+}
+}  // namespace
+
+iscsi_initiator_t *iscsi_initiator_new(void)
+{
+    return new_record<iscsi_initiator_t>();
+}
+
+void iscsi_initiator_free(iscsi_initiator_t *initiator)
+{
+    free_record(initiator);
+}
+
+iscsi_map_lun_t *iscsi_map_lun_new(void)
+{
+    iscsi_map_lun_t *m = new_record<iscsi_map_lun_t>();
+    if (m)
+        m->lun_num = -1;
+    return m;
+}
+
+void iscsi_map_lun_free(iscsi_map_lun_t *map_lun)
+{
+    free_record(map_lun);
+}
+
+iscsi_lun_acl_t *iscsi_lun_acl_new(void)
+{
+    return new_record<iscsi_lun_acl_t>();
+}
+
+void iscsi_lun_acl_free(iscsi_lun_acl_t *lun_acl)
+{
+    free_record(lun_acl);
+}
+
 /* -------------------------------------------------------------- selection */
 
 int iscsi_mod_select(int type)

@@ -24,6 +24,7 @@ extern "C" {
 #define ISCSI_INITIATOR_LEN    256
 #define ISCSI_LUN_PATH_LEN     512
 #define ISCSI_TPGT_MAX         63  /* portal group tags are 0..63 */
+#define ISCSI_LUN_NUM_MAX      255 /* LUN numbers are 0..255 */
 
 /* A target as target management holds it. The driver reads the fields
  * below; the wanted portals are owned by the record. */
@@ -59,14 +60,17 @@ typedef struct iscsi_initiator_s {
     list_node_t node;
 } iscsi_initiator_t;
 
-/* A LUN mapped into a target under a LUN number. */
+/* A LUN mapped into a target under a LUN number; target and lun are
+ * references, not owned. */
 typedef struct iscsi_map_lun_s {
-    int lun_num;
+    int lun_num;                          /* 0..255; -1 until assigned */
     iscsi_target_t *target;
     iscsi_lun_t *lun;
+    list_node_t node;
 } iscsi_map_lun_t;
 
-/* One initiator's access right to one mapped LUN. */
+/* One initiator's access right to one mapped LUN; map_lun and initiator are
+ * references, not owned. */
 typedef struct iscsi_lun_acl_s {
     iscsi_map_lun_t *map_lun;
     iscsi_initiator_t *initiator;
@@ -83,6 +87,15 @@ void iscsi_target_free(iscsi_target_t *target);
 iscsi_lun_t *iscsi_lun_new(void);
 /* Unlinks and frees; NULL is ignored. */
 void iscsi_lun_free(iscsi_lun_t *lun);
+/* Zeroed records (a mapping's lun_num -1, a LUN ACL's right deny, no
+ * references); NULL when memory is short. Each free unlinks the record and
+ * frees it alone, never what it refers to; NULL is ignored. */
+iscsi_initiator_t *iscsi_initiator_new(void);
+void iscsi_initiator_free(iscsi_initiator_t *initiator);
+iscsi_map_lun_t *iscsi_map_lun_new(void);
+void iscsi_map_lun_free(iscsi_map_lun_t *map_lun);
+iscsi_lun_acl_t *iscsi_lun_acl_new(void);
+void iscsi_lun_acl_free(iscsi_lun_acl_t *lun_acl);
 
 /* The operations table: 22 slots in this fixed order. */
 typedef struct iscsi_mod_ops_s {

@@ -1,5 +1,6 @@
 /* The LIO back end of the kernel target driver: configfs primitives, the
- * three kernel modules, and the target-side operations.
+ * three kernel modules, the target-side operations, backstores, LUN mapping
+ * and ACLs.
  *
  * configfs tree driven here (all under the system root):
  *
@@ -7,9 +8,11 @@
  *     iscsi/<iqn>/tpgt_<n>/        T, the portal group of a target
  *       enable, attrib/, param/      switches and parameters
  *       np/<addr>:<port>             network portals ("[v6]:port", "[v6%if]:port")
- *       acls/<initiator>/            per-initiator auth/, attrib/, lun_<m>/
+ *       acls/<initiator>/            per-initiator auth/, attrib/,
+ *         lun_<m>/lun_<m>              link to lun/lun_<m>; write_protect
  *       lun/lun_<m>/<lun name>       link to the backstore
- *     core/fileio_<hba>/<lun name>/  backstores
+ *     core/fileio_<hba>/<lun name>/  backstores: control, enable, wwn/
+ *   /var/target/alua/tpgs_<serial>   ALUA state of a backstore
  *   /var/target/{pr,alua}            kernel state directories
  *
  * Attributes are written through the shell (values and paths escaped, never
@@ -31,7 +34,7 @@ extern "C" {
 #define IP_TYPE_V4 1
 #define IP_TYPE_V6 2
 
-/* The LIO table (type 2): slots 0..10 and 13 filled, the rest empty. */
+/* The LIO table (type 2): slots 0..20 filled, 21 empty. */
 extern const iscsi_mod_ops_t lio3_mod_ops;
 
 /* ---- configfs primitives ---- */
@@ -111,11 +114,59 @@ int lio3_set_target_attr_dataout_timeout(int timeout, iscsi_target_t *target);
  * do not parse are dropped. -9973 when the np directory cannot be read. */
 int lio3_get_target_existing_ip_list(list_t *ip_list, iscsi_target_t *target);
 
-/* ---- backstores (slots 11..14) ---- */
+/* ---- backstores and LUN mapping (slots 11..16) ----
+ * LUN checks, each -9989: NULL, a name that is empty or not one path
+ * component, an empty backing path ("lun device path is empty") or one with
+ * ',' or a line end ("lun device path error"), size 0, a negative HBA id, a
+ * serial that is not one path component. B below is the backstore directory
+ * core/fileio_<hba_id>/<name>. */
 
+/* Creates the backing file when absent, then B with its control
+ * "fd_dev_name=<path>,fd_dev_size=<size>,fd_buffered_io=1", the serial and
+ * the enable switch. An existing B is left untouched (0). -9973 on a failed
+ * step, after taking away what the call made (B, the HBA directory, the
+ * file). */
+int lio3_add_backstore(iscsi_lun_t *lun);
 /* Slot 13: removes the LUN's fileio backstore (and its ALUA state). An
  * absent one answers 0; -9989 on bad LUN fields or failure. */
 int lio3_shutdown_backstore(iscsi_lun_t *lun);
+/* Slot 13's removal; then deletes the backing file only when its real path
+ * lies under "/.systemfile/iscsi_target/fileio/" (a failure there is only
+ * logged). */
+int lio3_del_backstore(iscsi_lun_t *lun);
+/* Writes "fd_dev_size=<size>" to B's control. -9969 when B is absent. */
+int lio3_change_backstore_size(iscsi_lun_t *lun);
+/* Maps the LUN's backstore as lun_<lun_number> (0..255) of the target's
+ * portal group. A LUN record without a number takes lun_number; one with a
+ * different number is refused. -9989 bad arguments, a missing backstore or
+ * portal group; -9986 no backing file; -9970 the number is taken; -9973 the
+ * kernel refused (nothing is left behind). */
+int lio3_add_lun_mapping(iscsi_lun_t *lun, iscsi_target_t *target, int lun_number);
+/* Unmaps lun->lun_num of the target. An absent mapping answers 0; -9969 when
+ * the LUN's backstore is gone; -9973 when the kernel refuses (an ACL still
+ * maps the LUN). */
+int lio3_del_lun_mapping(iscsi_lun_t *lun, iscsi_target_t *target);
+
+/* ---- ACL nodes and rights (slots 17..20) ---- */
+
+/* Creates the initiator's ACL node (a name that is not one path component:
+ * -9989), then pushes the target's CHAP credentials and data-out time-out
+ * to it (results ignored). "default_policy" is never created and answers 0.
+ * -9968 when the portal group is not in the kernel; -9973 when the node
+ * cannot be made. */
+int lio3_add_acl_initiator(const char *initiator_name, iscsi_target_t *target);
+/* Removes the node with its mapped LUNs. An absent node or target, and
+ * "default_policy", answer 0; -9973 when it cannot be removed. */
+int lio3_del_acl_initiator(const char *initiator_name, iscsi_target_t *target);
+/* Applies lun_acl->access_right (0 deny, 1 read-only, 2 read-write) for its
+ * initiator to its mapped LUN. Deny unmaps it, with an enabled target
+ * switched off around the change and on again; the other rights map it
+ * with write_protect 1 or 0 (verified). -9989 bad record; -9973 failure,
+ * leaving no new link behind. */
+int lio3_add_lun_acl(iscsi_lun_acl_t *lun_acl);
+/* Sets the record's right to deny and applies it. */
+int lio3_del_lun_acl(iscsi_lun_acl_t *lun_acl);
+
 
 #ifdef __cplusplus
 }

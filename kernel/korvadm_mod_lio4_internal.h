@@ -111,6 +111,20 @@ int write_switch_and_auth_method(const char *func, const char *iqn, int tpgt, co
 // Writes the credentials the target's settings switch on to one ACL.
 int push_chap(const char *func, const iscsi_target_t *target, const char *initiator);
 
+/* korvadm_mod_lio4_storage.cpp: LUN records and trees */
+
+// What a slot needs of a LUN record beyond its name, HBA id and serial.
+enum lun_needs { NAME_HBA = 0, PATH = 1, SIZE = 2 };
+// The LUN checks the slots share, each failure logged under `func` with
+// -9989. The backing path becomes "fd_dev_name=<path>,..." of the control
+// attribute, where a ',' or a line end would add keys of its own.
+int check_lun(const char *func, const iscsi_lun_t *lun, int needs);
+// lstat: a link counts, dangling or not.
+bool entry_exists(const std::string &path);
+// Removes a configfs group the kernel's way, then with "rm -rf" whatever is
+// left (plain directories); 0 once path is gone, else -9973.
+int remove_tree(const std::string &path);
+
 }  // namespace lio4
 
 // Logs and returns -9989 from the calling operation when the target is
@@ -198,6 +212,33 @@ int _lio3_set_target_chap_all_acl(const iscsi_target_t *target);
 int _lio3_remove_fileio_device(iscsi_lun_t *lun);
 /* Shuts down every fileio backstore and removes every HBA directory. */
 int _lio3_shutdown_all_hba(void);
+/* B with its control, serial and ALUA state directory; on a failed write B
+ * is removed again. */
+int _lio3_create_fileio_device(iscsi_lun_t *lun);
+/* Removes B whatever it holds; -9973 when it stays. */
+int _lio3_remove_fileio_device_brute_force(iscsi_lun_t *lun);
+
+/* korvadm_mod_lio4_lun.cpp (lun->lun_num is the LUN number) */
+
+/* lun/lun_<n> with its link to B and alua_tg_pt_write_md; the group goes
+ * again when the link cannot be made. */
+int _lio3_add_lun_to_target(iscsi_lun_t *lun, iscsi_target_t *target);
+/* Unlinks lun/lun_<n>'s entries but the ALUA attributes, removes the group
+ * and its ALUA state directory. */
+int _lio3_del_lun_from_target(iscsi_lun_t *lun, iscsi_target_t *target);
+int _lio3_del_all_port_in_target_lun(iscsi_lun_t *lun, iscsi_target_t *target);
+/* Unlinks lun_<n>/<name> and removes lun_<n>; no operation calls it. */
+int _lio3_remove_lun(iscsi_lun_t *lun, iscsi_target_t *target);
+
+/* korvadm_mod_lio4_acl.cpp */
+
+/* acls/<name> ("default_policy" is never made; 0). */
+int _lio3_add_acl_initiator(const char *initiator_name, iscsi_target_t *target);
+/* Removes acls/<name> with its mapped LUNs; an absent node answers 0. */
+int _lio3_del_acl_initiator(const char *initiator_name, iscsi_target_t *target);
+int _lio3_set_lun_acl_read_only(iscsi_lun_acl_t *lun_acl);
+int _lio3_set_lun_acl_read_write(iscsi_lun_acl_t *lun_acl);
+int _lio3_set_lun_acl_deny(iscsi_lun_acl_t *lun_acl);
 }
 
 #endif

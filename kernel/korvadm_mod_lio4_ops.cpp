@@ -15,16 +15,16 @@ const iscsi_mod_ops_t lio3_mod_ops = {
     .set_target_ip = lio3_set_target_ip,                                     // _portal.cpp
     .set_target_attr_dataout_timeout = lio3_set_target_attr_dataout_timeout, // _target.cpp
     .get_target_existing_ip_list = lio3_get_target_existing_ip_list,         // _portal.cpp
-    .add_backstore = nullptr,
-    .del_backstore = nullptr,
-    .shutdown_backstore = lio3_shutdown_backstore,                           // _storage.cpp
-    .change_backstore_size = nullptr,
-    .add_lun_mapping = nullptr,
-    .del_lun_mapping = nullptr,
-    .add_acl_initiator = nullptr,
-    .del_acl_initiator = nullptr,
-    .add_lun_acl = nullptr,
-    .del_lun_acl = nullptr,
+    .add_backstore = lio3_add_backstore,                                     // _storage.cpp
+    .del_backstore = lio3_del_backstore,
+    .shutdown_backstore = lio3_shutdown_backstore,
+    .change_backstore_size = lio3_change_backstore_size,
+    .add_lun_mapping = lio3_add_lun_mapping,                                 // _lun.cpp
+    .del_lun_mapping = lio3_del_lun_mapping,
+    .add_acl_initiator = lio3_add_acl_initiator,                             // _acl.cpp
+    .del_acl_initiator = lio3_del_acl_initiator,
+    .add_lun_acl = lio3_add_lun_acl,
+    .del_lun_acl = lio3_del_lun_acl,
     .get_target_session = nullptr,
 };
 
