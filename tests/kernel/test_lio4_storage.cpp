@@ -1,0 +1,158 @@
+// Backstores and LUN mapping on plain directories: argument checks, what a
+// value may never do, the order of the steps and what a failed step leaves.
+// How the kernel itself takes them is the VM suite's part.
+#include <unistd.h>
+
+#include <cstring>
+#include <string>
+
+#include <gtest/gtest.h>
+
+#include "common/korvadm_err.h"
+#include "kernel/korvadm_mod_lio4.h"
+#include "tests/kernel/sample_tree.h"
+
+namespace {
+
+const std::string CORE = "/sys/kernel/config/target/core";
+
+class Lio4Storage : public korv_test::SampleTree {
+protected:
+    void SetUp() override
+    {
+        SampleTree::SetUp();
+        lun = {};
+        lun.lun_num = -1;
+        set(lun.name, "disk1");
+        set(lun.path, at("/data/disk1.img"));
+        lun.size = 1048576;
+        lun.hba_id = 0;
+    }
+    iscsi_lun_t lun;
+};
+
+TEST_F(Lio4Storage, BadLunsAreRefusedBeforeAnythingIsMade)
+{
+    std::string canary = at("/CANARY");
+    const struct {
+        const char *field;
+        std::string value;
+    } bad[] = {
+        {"name", ""}, {"name", "a/b"}, {"name", ".."}, {"path", ""},
+        {"path", at("/x.img,fd_dev_name=") + canary},  // would add a control key of its own
+        {"path", at("/x.img\nfd_dev_size=1")}, {"serial", "../s"}, {"size", "0"}, {"hba", "-1"},
+    };
+    for (const auto &b : bad) {
+        SetUp();
+        if (!std::strcmp(b.field, "name"))
+            set(lun.name, b.value);
+        else if (!std::strcmp(b.field, "path"))
+            set(lun.path, b.value);
+        else if (!std::strcmp(b.field, "serial"))
+            set(lun.serial, b.value);
+        else if (!std::strcmp(b.field, "size"))
+            lun.size = 0;
+        else
+            lun.hba_id = -1;
+        EXPECT_EQ(lio3_add_backstore(&lun), ERR_PARAM) << b.field << "=" << b.value;
+    }
+    EXPECT_FALSE(exists(at("/sys")) || exists(at("/data")) || exists(canary));
+    EXPECT_EQ(lio3_add_backstore(nullptr), ERR_PARAM);
+
+    // Shell syntax in a value reaches the attribute as text; run, it would
+    // make the canary in the shell's working directory.
+    SetUp();
+    mkdirs(at("/data"));
+    ASSERT_EQ(chdir(root().c_str()), 0);
+    set(lun.path, at("/data/$(touch CANARY)`touch CANARY`\";touch CANARY;x.img"));
+    ASSERT_EQ(lio3_add_backstore(&lun), 0);
+    EXPECT_EQ(read_file(at(CORE + "/fileio_0/disk1/control")),
+              std::string("fd_dev_name=") + lun.path + ",fd_dev_size=1048576,fd_buffered_io=1");
+    EXPECT_TRUE(exists(lun.path));
+    EXPECT_FALSE(exists(canary));
+}
+
+TEST_F(Lio4Storage, BackstoreIsMadeOnceAndAFailedStepTakesBackWhatItMade)
+{
+    // Plain directories have no wwn/ group for the serial: the device and
+    // what the call made for it go again.
+    mkdirs(at("/data"));
+    set(lun.serial, "sn1");
+    EXPECT_EQ(lio3_add_backstore(&lun), ERR_CONFIGFS);
+    EXPECT_FALSE(exists(lun.path) || exists(at(CORE + "/fileio_0")));
+
+    lun.serial[0] = '\0';
+    ASSERT_EQ(lio3_add_backstore(&lun), 0);
+    std::string b = at(CORE + "/fileio_0/disk1");
+    EXPECT_EQ(read_file(lun.path), "");
+    EXPECT_EQ(read_file(b + "/enable"), "1");
+    std::string control = read_file(b + "/control");
+    lun.size = 2;
+    EXPECT_EQ(lio3_add_backstore(&lun), 0);
+    EXPECT_EQ(read_file(b + "/control"), control);
+
+    ASSERT_EQ(lio3_change_backstore_size(&lun), 0);
+    EXPECT_EQ(read_file(b + "/control"), "fd_dev_size=2");
+    lun.hba_id = 5;
+    EXPECT_EQ(lio3_change_backstore_size(&lun), ERR_BACKSTORE_MISSING);
+
+    // The HBA directory cannot hold the backstore: an existing backing file
+    // stays.
+    write_file(at(CORE + "/fileio_5"), "not a directory");
+    set(lun.path, at("/data/new.img"));
+    write_file(lun.path, "data");
+    EXPECT_EQ(lio3_add_backstore(&lun), ERR_CONFIGFS);
+    EXPECT_EQ(read_file(lun.path), "data");
+}
+
+TEST_F(Lio4Storage, DeleteRemovesOnlyFilesReallyInTheAppliancesDirectory)
+{
+    std::string own = at("/.systemfile/iscsi_target/fileio");
+    write_file(own + "/disk1.img", "");
+    write_file(at("/etc/x"), "keep");
+    ASSERT_EQ(symlink(at("/etc/x").c_str(), (own + "/link.img").c_str()), 0);
+    for (const std::string &path : {own + "/../../../etc/x", own + "/link.img", own + "/disk1.img"}) {
+        load_tree("tpg_storage.tree");
+        set(lun.path, path);
+        EXPECT_EQ(lio3_del_backstore(&lun), 0) << path;
+        EXPECT_FALSE(exists(at(CORE + "/fileio_0/disk1")));
+    }
+    EXPECT_EQ(read_file(at("/etc/x")), "keep");
+    EXPECT_FALSE(exists(own + "/disk1.img"));
+}
+
+TEST_F(Lio4Storage, MappingChecksThenMakesTheLunLinkAndAluaSwitch)
+{
+    load_tree("tpg_storage.tree");
+    std::string l0 = at(std::string(TPG) + "/lun/lun_0");
+    EXPECT_EQ(lio3_add_lun_mapping(&lun, &target, 0), ERR_BACKING_FILE_MISSING);
+    write_file(lun.path, "");
+    EXPECT_EQ(lio3_add_lun_mapping(&lun, &target, 256), ERR_PARAM);
+    set(target.iqn, "../t1");
+    EXPECT_EQ(lio3_add_lun_mapping(&lun, &target, 0), ERR_PARAM);
+    set(target.iqn, "iqn.2026-01.test:t1");
+    EXPECT_FALSE(exists(l0));
+
+    ASSERT_EQ(lio3_add_lun_mapping(&lun, &target, 0), 0);
+    EXPECT_EQ(lun.lun_num, 0);
+    char link[512] = {0};
+    ASSERT_GT(readlink((l0 + "/disk1").c_str(), link, sizeof link - 1), 0);
+    EXPECT_EQ(std::string(link), at(CORE + "/fileio_0/disk1"));
+    EXPECT_EQ(read_file(l0 + "/alua_tg_pt_write_md"), "1");
+    EXPECT_EQ(lio3_add_lun_mapping(&lun, &target, 0), ERR_LUN_ALREADY_MAPPED);
+    EXPECT_EQ(lio3_add_lun_mapping(&lun, &target, 1), ERR_PARAM);  // the record says 0
+
+    // Unmapping unlinks the backstore and leaves the kernel's attributes,
+    // which go with the group on the kernel (here, by hand).
+    EXPECT_EQ(lio3_del_lun_mapping(&lun, &target), ERR_CONFIGFS);
+    EXPECT_FALSE(exists(l0 + "/disk1"));
+    EXPECT_TRUE(exists(l0 + "/alua_tg_pt_write_md"));
+    std::remove((l0 + "/alua_tg_pt_write_md").c_str());
+    EXPECT_EQ(lio3_del_lun_mapping(&lun, &target), 0);
+    EXPECT_FALSE(exists(l0) || exists(at("/var/target/alua/iSCSI/iqn.2026-01.test:t1+1/lun_0")));
+    EXPECT_EQ(lio3_del_lun_mapping(&lun, &target), 0);  // already gone
+    lun.hba_id = 3;
+    EXPECT_EQ(lio3_del_lun_mapping(&lun, &target), ERR_BACKSTORE_MISSING);
+}
+
+}  // namespace
