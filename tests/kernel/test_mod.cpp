@@ -75,28 +75,28 @@ TEST_F(ModTest, SelectAcceptsOnlyTheLioTypeAndWithoutATableEachWrapperAnswersIts
     EXPECT_EQ(iscsi_mod_get_target_ip_list_in_target_parm(&list_, "iqn.x", 1), ERR_PARAM);
 }
 
-TEST_F(ModTest, LioTableLeavesLaterSlotsEmpty)
+TEST_F(ModTest, LioTableFillsEverySlotButTheSessionListing)
 {
     ASSERT_EQ(iscsi_mod_select(ISCSI_MOD_TYPE_LIO), 0);
     EXPECT_EQ(iscsi_mod_ops, &lio3_mod_ops);
+    EXPECT_EQ(iscsi_mod_get_target_session(&list_, &list_, &target_), ERR_OP_NOT_PROVIDED);
+    // Filled slots reach the back end, which checks the (empty) records itself.
     iscsi_initiator_t initiator{};
     iscsi_map_lun_t map{};
     iscsi_lun_acl_t acl{};
     acl.map_lun = &map;
     acl.initiator = &initiator;
+    lun_.hba_id = -1;
     const int results[] = {
-        iscsi_mod_add_backstore(&lun_),      iscsi_mod_del_backstore(&lun_),
+        iscsi_mod_add_target(&target_),         iscsi_mod_shutdown_backstore(&lun_),
+        iscsi_mod_add_backstore(&lun_),         iscsi_mod_del_backstore(&lun_),
         iscsi_mod_change_backstore_size(&lun_), iscsi_mod_add_lun_mapping(&lun_, &target_, 0),
         iscsi_mod_del_lun_mapping(&lun_, &target_), iscsi_mod_add_acl_initiator("iqn.i", &target_),
         iscsi_mod_del_acl_initiator("iqn.i", &target_), iscsi_mod_add_lun_acl(&acl),
-        iscsi_mod_del_lun_acl(&acl),         iscsi_mod_get_target_session(&list_, &list_, &target_),
+        iscsi_mod_del_lun_acl(&acl),
     };
     for (size_t i = 0; i < std::size(results); ++i)
-        EXPECT_EQ(results[i], ERR_OP_NOT_PROVIDED) << "wrapper " << i;
-    // Filled slots reach the back end, which checks the record itself.
-    EXPECT_EQ(iscsi_mod_add_target(&target_), ERR_PARAM);
-    lun_.hba_id = -1;
-    EXPECT_EQ(iscsi_mod_shutdown_backstore(&lun_), ERR_PARAM);
+        EXPECT_EQ(results[i], ERR_PARAM) << "wrapper " << i;
 }
 
 TEST_F(ModTest, WrappersCheckArgumentsThenPassThemThrough)
