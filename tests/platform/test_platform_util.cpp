@@ -7,16 +7,18 @@
 #include <cstdint>
 #include <cstdlib>
 #include <cstring>
+#include <filesystem>
 #include <gtest/gtest.h>
 #include <set>
 #include <string>
+#include <sys/stat.h>
 #include <unistd.h>
 #include <vector>
 
 using korv_test::SysRoot;
 using korv_test::XmldbService;
 
-TEST(PlatformDb, IntegersAndStrings)
+TEST(PlatformDb, IntegersStringsAndTheSavedFile)
 {
     XmldbService db;
     EXPECT_EQ(dbGetLL("/system_mgr/iscsi/enable"), 0);
@@ -38,6 +40,23 @@ TEST(PlatformDb, IntegersAndStrings)
     EXPECT_EQ(dbDelete("/system_mgr/iscsi/iSNS"), 0);
     EXPECT_EQ(dbGetStr(buf, sizeof buf, "/system_mgr/iscsi/iSNS/ip"), 0);
     EXPECT_STREQ(buf, "");
+
+    // The saved file goes to the persistent partition whole and private;
+    // without that partition (or a saved file) nothing is written anywhere.
+    SysRoot::remove("/usr/local");
+    SysRoot::remove("/etc/NAS_CFG/config.xml");
+    SysRoot::mkdirs("/usr/local");
+    EXPECT_EQ(LIB_CP_Config_To_MTD(1), -1);
+    ASSERT_EQ(xml_write_file("/etc/NAS_CFG/config.xml"), 0);
+    ASSERT_EQ(LIB_CP_Config_To_MTD(1), 0);
+    const std::string copy = SysRoot::read("/usr/local/config/config.xml");
+    EXPECT_EQ(copy, SysRoot::read("/etc/NAS_CFG/config.xml"));
+    EXPECT_NE(copy.find("99999999999999999999"), std::string::npos);
+    struct stat st{};
+    EXPECT_TRUE(::stat(SysRoot::file("/usr/local/config/config.xml").c_str(), &st) == 0 && (st.st_mode & 0777) == 0600);
+    SysRoot::remove("/usr/local");
+    EXPECT_EQ(LIB_CP_Config_To_MTD(1), -1);
+    EXPECT_NE(::access(SysRoot::file("/usr/local").c_str(), F_OK), 0);
 
     db.stop();
     EXPECT_EQ(dbGetStr(buf, sizeof buf, "/system_mgr/iscsi/enable"), -1);
@@ -116,11 +135,9 @@ TEST(PlatformStrings, Str2llIsStrictAndStrsepExCollapsesRuns)
 
 TEST(PlatformQueries, MountPointsFromMountinfo)
 {
-    SysRoot::write("/proc/self/mountinfo",
-                   "22 1 0:21 / /sys rw,nosuid shared:7 - sysfs sysfs rw\n"
-                   "36 22 0:30 / /sys/kernel/config rw,relatime shared:13 - configfs configfs rw\n"
-                   "40 1 9:1 / /mnt/Volume\\0401 rw shared:20 - ext4 /dev/md1 rw\n"
-                   "garbage line\n");
+    SysRoot::mkdirs("/proc/self");
+    std::filesystem::copy_file(KORV_TEST_DATA "/mountinfo", SysRoot::file("/proc/self/mountinfo"),
+                               std::filesystem::copy_options::overwrite_existing);
     const char *p = "/sys/kernel/config";
     EXPECT_EQ(sys_mount_point(p), p);
     EXPECT_NE(sys_mount_point("/sys/kernel/config/"), nullptr);
@@ -181,25 +198,4 @@ TEST(PlatformQueries, LanLinkSpeedAndRandomNumbers)
         seen.insert(sys_random());
     EXPECT_GE(*seen.begin(), 0);
     EXPECT_GT(seen.size(), 8u);
-}
-
-TEST(PlatformPersist, SavedConfigurationIsCopiedWhole)
-{
-    SysRoot::remove("/usr/local");
-    SysRoot::remove("/etc/NAS_CFG/config.xml");
-    SysRoot::mkdirs("/usr/local");
-    EXPECT_EQ(LIB_CP_Config_To_MTD(1), -1);  // nothing saved yet
-
-    XmldbService db;
-    ASSERT_EQ(dbSetStr("persisted", "/iscsi/target/id:1/name"), 0);
-    ASSERT_EQ(xml_write_file("/etc/NAS_CFG/config.xml"), 0);
-    ASSERT_EQ(LIB_CP_Config_To_MTD(1), 0);
-    std::string copy = SysRoot::read("/usr/local/config/config.xml");
-    EXPECT_EQ(copy, SysRoot::read("/etc/NAS_CFG/config.xml"));
-    EXPECT_NE(copy.find("persisted"), std::string::npos);
-
-    // Without the persistent partition nothing is written anywhere.
-    SysRoot::remove("/usr/local");
-    EXPECT_EQ(LIB_CP_Config_To_MTD(1), -1);
-    EXPECT_NE(::access(SysRoot::file("/usr/local").c_str(), F_OK), 0);
 }
