@@ -186,7 +186,8 @@ TEST(XmldbBadInput, StuckAndGreedyClientsStayWithinTheAnswerBudgetAndOthersAreSe
 }
 
 // More clients than slots: the longest idle are hung up on. More than the
-// descriptor limit allows: the service waits for one to leave, not spinning.
+// descriptor limit allows (lowered while they close): the service sheds or
+// waits for one to leave, neither spinning nor giving up.
 TEST(XmldbBadInput, ConnectionFloodsNeitherLockOthersOutNorMakeTheServiceSpin)
 {
     XmldbService db;
