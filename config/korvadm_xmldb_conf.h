@@ -23,7 +23,7 @@
 extern "C" {
 #endif
 
-/* The store's operations table; slots of later work are NULL. */
+/* The store's operations table (korvadm_xmldb_conf_ops.cpp). */
 extern const iscsi_conf_ops_t iscsi_conf_ops;
 
 /* Recounts the ACL initiators (1..129) into "/iscsi/acl/count". 0 / -9981. */
@@ -79,6 +79,100 @@ int xmldb_del_target_conn_info(const char *name);
 /* Writes connection conn's ip and iqn: 0, -9981 on a failed write, 6 when
  * there is no such target. */
 int xmldb_set_target_conn_info(const char *name, int conn, const char *ip, const char *iqn);
+
+/* ---- LUNs: at most 128 under "/iscsi/lun", keyed by "name" ---- */
+
+/* Validates conf (name shorter than CONF_NAME_LEN, uuid, serial, size > 0,
+ * prealloc 0/1; -9989 before any write), sets conf->vol_state = 1, takes the
+ * free entry (-9979 when 128 exist) and writes name, uuid, serial, size,
+ * sector 512, devid, prealloc, img_file, vol_state, then bumps the count. */
+int xmldb_add_new_lun(lun_conf_t *conf);
+/* Deletes the entry and its subtree; later entries are not renumbered. */
+int xmldb_del_lun_by_name(const char *name);
+int xmldb_check_lun_exist(const char *name);
+/* 1 when the name exists, -9979 when 128 others exist, 0 when it can be added. */
+int xmldb_check_add_lun(const char *name);
+/* Field operations by LUN name: "" or NULL name -9989, unknown -9980. Text
+ * readers cut to size. Setters refuse (-9989, nothing written) a negative
+ * vol_state, prealloc_state or connect state, a progress outside 0..100 and
+ * a NULL serial or status ("" clears the status). */
+int xmldb_get_lun_uuid(char *buf, size_t size, const char *name);
+int xmldb_get_lun_img_file(char *buf, size_t size, const char *name);
+int xmldb_get_lun_serial(char *buf, size_t size, const char *name);
+int xmldb_set_lun_serial(const char *serial, const char *name);
+int xmldb_get_lun_vol_state(int *state, const char *name);
+int xmldb_set_lun_vol_state(int state, const char *name);
+int xmldb_get_lun_size(uint64_t *size, const char *name);
+int xmldb_set_lun_size(uint64_t size, const char *name);
+int xmldb_get_lun_alloc_size(uint64_t *size, const char *name);
+int xmldb_set_lun_alloc_size(uint64_t size, const char *name);
+int xmldb_get_lun_connect_state(int *state, const char *name);
+int xmldb_set_lun_connect_state(int state, const char *name);
+int xmldb_get_lun_prealloc(int *prealloc, const char *name);
+int xmldb_get_lun_prealloc_state(int *state, const char *name);
+int xmldb_set_lun_prealloc_state(int state, const char *name);
+int xmldb_set_lun_prealloc_progress(int progress, const char *name);
+int xmldb_get_lun_status(char *buf, size_t size, const char *name);
+int xmldb_set_lun_status(const char *status, const char *name);
+/* Lowest device number 0..127 no LUN uses; -9979 (*devid = -1) if none. */
+int xmldb_get_free_lun_devid(int *devid);
+/* Record readers. A missing number keeps its unknown value (devid,
+ * vol_state, prealloc_state, connected, lun_num -1; prealloc, sizes 0). The
+ * list readers skip a record that cannot be filled (a name too long for the
+ * record among them) and fail whole, appending nothing, only with -9992 when
+ * the service does not answer, or -9987. The crash reader reads as the full
+ * one does. By UUID: the first LUN on that volume. */
+int xmldb_get_all_lun_conf(list_t *list);
+int xmldb_get_all_lun_conf_lite(list_t *list);
+int xmldb_get_all_lun_conf_in_crash_conf(list_t *list);
+int xmldb_get_lun_conf_by_name(lun_conf_t *conf, const char *name);
+int xmldb_get_lun_conf_by_uuid(lun_conf_t *conf, const char *uuid);
+/* Recounts LUNs over 1..128 (gaps included) into "/iscsi/lun/count", then
+ * deletes entry count + 1 when it holds a status but no name. */
+int xmldb_update_lun_current_count(void);
+
+/* ---- target-LUN mapping: "/iscsi/target/id:N/map_lun", at most 128 ---- */
+
+/* Writes the map entry (lun_name, lun_num), then the LUN's target_name and
+ * lun_num, then bumps the map count; when a write fails the map entry is
+ * deleted and the LUN's target_name emptied again (-9981). */
+int xmldb_add_target_lun_map(const char *target_name, const char *lun_name, int lun_num);
+/* Deletes the map entry, empties the LUN's target_name, lowers the count. */
+int xmldb_del_target_lun_map(const char *target_name, const char *lun_name);
+/* Lowest LUN number 0..127 the target's map does not use; -9979 if none. */
+int xmldb_get_free_lun_num(int *lun_num, const char *target_name);
+/* The LUN's target ("" when not mapped) and LUN number. */
+int xmldb_get_mapping_target(char *target_name, size_t size, int *lun_num, const char *lun_name);
+/* Appends one record per map entry of the target. */
+int xmldb_get_target_map_lun_conf(const char *target_name, list_t *list);
+
+/* ---- ACLs: initiators (at most 129 under "/iscsi/acl") and their rights,
+ * each right kept on both sides: the initiator's "mapped_lun" list and the
+ * LUN's "acl" list. Rights are written "DENY", "RO", "RW". ---- */
+
+/* 1 when an initiator (alias) is known, else 0. */
+int xmldb_check_acl_initiaor_exist(const char *initiator);
+int xmldb_check_acl_alias_exist(const char *alias);
+/* 0 when neither the initiator nor the alias is known; 1 when either is. */
+int xmldb_check_add_acl_initiator(const char *initiator, const char *alias);
+/* -9979 when 129 initiators exist; -9989 for an initiator too long. */
+int xmldb_add_acl_initiator(const char *initiator, const char *alias);
+/* Removes the initiator's entry under each LUN it has a right on, then the
+ * initiator; a missing other side is logged and passed. */
+int xmldb_del_acl_initiator(const char *initiator);
+int xmldb_get_all_acl_initiator_conf_lite(list_t *list);
+/* Grants access_right (0 deny, 1 read-only, 2 read-write) on the LUN, adding
+ * an unknown initiator first; both sides are written, then recounted. */
+int xmldb_set_lun_acl(const char *initiator, const char *alias, const char *lun_name, int access_right);
+int xmldb_get_all_lun_acl_conf_from_lun(const char *lun_name, list_t *list);
+/* Removes the LUN from every initiator that has a right on it. */
+int xmldb_remove_lun_from_all_acl(const char *lun_name);
+/* The initiator whose alias this is ("" when none, or when it does not fit size). */
+int xmldb_get_initiator_name_from_alias(char *buf, size_t size, const char *alias);
+/* Deletes "/iscsi/acl"; always 0. */
+int xmldb_clean_acl_conf(void);
+/* Records the result of the initiator's access to the LUN. */
+int xmldb_update_sess_acl_lun_access_status(const char *initiator, const char *lun_name, unsigned status);
 
 /* ---- service settings ---- */
 

@@ -11,6 +11,7 @@
 #include <cstddef>
 #include <cstdio>
 #include <cstring>
+#include <initializer_list>
 
 #include "common/korvadm_err.h"
 #include "common/korvadm_log.h"
@@ -57,6 +58,26 @@ int _xmldb_update_current_aclcnt(void);
 /* Entry number of the named target (>= 1); -9980 when it is not found,
  * -9989 for NULL, -9981 on a scan failure. */
 int _xmldb_get_target_dbidx_by_name(const char *name);
+
+/* ---- korvadm_xmldb_conf_lun.cpp, korvadm_xmldb_conf_lun_read.cpp ---- */
+
+/* Entry number of the named LUN, as _xmldb_get_target_dbidx_by_name. */
+int _xmldb_get_lun_dbidx_by_name(const char *name);
+/* Fills every field of conf but its name from LUN entry n; a missing
+ * number keeps the field's unknown value. 0, or the failed read's code. */
+int _xmldb_fill_lun_conf(lun_conf_t *conf, int n);
+
+/* ---- korvadm_xmldb_conf_acl.cpp, korvadm_xmldb_conf_sess.cpp ---- */
+
+/* Entry number of the initiator under "/iscsi/acl" (>= 1), or a code. */
+int _xmldb_acl_get_dbidx_by_name(const char *initiator);
+/* Entry number of initiator under LUN entry lun's "acl", or a code. */
+int _xmldb_lun_acl_get_dbidx(int lun, const char *initiator);
+/* Entry number of lun_name under ACL entry acl's "mapped_lun", or a code. */
+int _xmldb_acl_get_mapped_lun_dbidx(int acl, const char *lun_name);
+/* Recount the two sides' lists of one entry. 0 / -9981. */
+int _xmldb_update_current_lun_aclcnt(int lun);
+int _xmldb_update_current_acl_mapluncnt(int acl);
 }
 
 namespace xmldb_conf {
@@ -177,8 +198,63 @@ int read_into(list_t *out, void (*free_list)(list_t *), Read read)
     return KORV_OK;
 }
 
-// Entry number of a target for the single-field operations: >= 1, or the
-// operation's result code, logged under the operation's name.
+// A keyed list of the schema: its root, capacity and key field.
+struct Keyed {
+    const char *root;
+    int max;
+    const char *key;
+};
+inline constexpr Keyed kTargets{kTargetRoot, CONF_MAX_TARGETS, "name"};
+inline constexpr Keyed kLuns{"/iscsi/lun", CONF_MAX_LUNS, "name"};
+inline constexpr Keyed kAcls{"/iscsi/acl", CONF_MAX_ACLS, "initiator"};
+inline constexpr Keyed kSessions{"/iscsi/sess/initiator", CONF_MAX_ACLS, "name"};
+
+// Entry number of value in list: >= 1, or the operation's result code
+// (-9980 not found, logged with not_found_fmt, one %s, at not_found_level;
+// -9981 when the scan itself fails), logged under the operation's name.
+int find_entry(const char *func, const Keyed &list, const char *value, const char *not_found_fmt,
+               int not_found_level = 0);
+// The target form of find_entry, with the target's message.
 int find_target(const char *func, const char *name);
+
+// Whether value is the key of an entry, scanning 1..max up to the first
+// empty key: 1 found; -9979 when all max entries hold other keys; else 0.
+int check_entry(const char *func, const char *root, int max, const char *key, const char *value);
+
+// Lowest number 0..capacity-1 that no entry's int field holds, reading
+// entries 1..capacity+1 up to the first unreadable one; logs found_fmt (one
+// %d) at level 2. -9979 with *out = -1 when all are used.
+int free_number(const char *func, const char *root, const char *field, int capacity, int *out,
+                const char *found_fmt);
+
+// A count read back from the database, trusted no further than a list's
+// capacity: negative, unreadable or not a number counts as 0.
+int read_count(const char *path, int capacity);
+
+// One value of an entry's write sequence, and the message its failure logs
+// (arguments: path, value).
+struct FieldWrite {
+    const char *field;
+    const char *text;  // a text value, or nullptr for a number
+    long long number;  // written "%d" (or "%llu" when u64)
+    const char *fail;
+    bool u64 = false;
+};
+// Writes the fields of entry n of root in order; the first failure is
+// logged under func and gives -9981 (what was written stays).
+int write_fields(const char *func, const char *root, int n, std::initializer_list<FieldWrite> fields);
+
+// Removes entry n of a dense sub-list without hiding the entries after it:
+// the last entry's fields move into n, then the last entry goes. 0, or
+// -9981 (logged "del node %s failed") when a write or delete fails.
+int remove_compact(const char *func, const char *root, int n, int max, const char *key,
+                   std::initializer_list<const char *> fields);
+
+// Path of entry n's sub-list root ("<root>/id:<n>/<sub>").
+template <size_t N>
+const char *sub_root(char (&buf)[N], const char *root, int n, const char *sub)
+{
+    return pathf(buf, N, "%s/id:%d/%s", root, n, sub);
+}
 
 }  // namespace xmldb_conf

@@ -2,6 +2,7 @@
 // counters kept beside the lists.
 #include <cstdint>
 #include <cstring>
+#include <vector>
 
 #include "common/korvadm_err.h"
 #include "config/korvadm_utils_db.h"
@@ -144,6 +145,125 @@ int xmldb_conf::remove_ghost(const char *func, const char *root, int n)
     DBG_AS(func, 1, "discover and remove ghost entry at PATH: %s", path);
     if (xmldb_delete_node(path) != KORV_OK) {
         DBG_AS(func, 0, "xmldbc_delete(%s) failed", path);
+        return ERR_DB_WRITE;
+    }
+    return KORV_OK;
+}
+
+int xmldb_conf::find_entry(const char *func, const Keyed &list, const char *value, const char *not_found_fmt,
+                           int not_found_level)
+{
+    int n = 0;
+    int rc = _search_xmldb_id_entry(&n, list.root, list.max, list.key, value);
+    switch (rc) {
+    case ID_ENTRY_FOUND:
+        return n;
+    case ID_ENTRY_NOT_FOUND:
+        DBG_AS(func, not_found_level, not_found_fmt, value);
+        return ERR_NOT_FOUND;
+    case ERR_PARAM:
+        DBG_AS(func, 0, "_search_xmldb_id_entry failed");
+        return ERR_DB_WRITE;
+    default:
+        DBG_AS(func, 0, "IT SHOULD NEVER BE HERE, func_ret = %d", rc);
+        return ERR_DB_WRITE;
+    }
+}
+
+int xmldb_conf::check_entry(const char *func, const char *root, int max, const char *key, const char *value)
+{
+    for (int n = 1; n <= max; n++) {
+        char got[kKeyLen];
+        if (!read_key(root, n, key, got)) {
+            char path[kPathLen];
+            DBG_AS(func, 1, "xmldbc_get(%s) failed", entry_path(path, root, n, key));
+            return 0;
+        }
+        if (std::strcmp(got, value) == 0)
+            return 1;
+    }
+    return ERR_NO_ROOM;
+}
+
+int xmldb_conf::free_number(const char *func, const char *root, const char *field, int capacity, int *out,
+                            const char *found_fmt)
+{
+    std::vector<bool> used(capacity, false);
+    // One past the capacity, so a list that somehow holds more still stops.
+    for (int n = 1; n <= capacity + 1; n++) {
+        char path[kPathLen];
+        int32_t v = 0;
+        if (xmldb_get_int32_t(&v, entry_path(path, root, n, field)) != KORV_OK) {
+            DBG_AS(func, 2, "get free devid break at %d", n);
+            break;
+        }
+        if (v >= 0 && v < capacity)
+            used[v] = true;
+    }
+    for (int id = 0; id < capacity; id++) {
+        if (!used[id]) {
+            *out = id;
+            DBG_AS(func, 2, found_fmt, id);
+            return KORV_OK;
+        }
+    }
+    *out = -1;
+    DBG_AS(func, 0, "can not get free devid");
+    return ERR_NO_ROOM;
+}
+
+int xmldb_conf::read_count(const char *path, int capacity)
+{
+    int32_t count = 0;
+    if (xmldb_get_int32_t(&count, path) != KORV_OK || count < 0)
+        return 0;
+    return count < capacity ? count : capacity;
+}
+
+int xmldb_conf::write_fields(const char *func, const char *root, int n, std::initializer_list<FieldWrite> fields)
+{
+    for (const FieldWrite &f : fields) {
+        char path[kPathLen];
+        entry_path(path, root, n, f.field);
+        int rc;
+        if (f.text)
+            rc = xmldb_set_cstring(f.text, path);
+        else if (f.u64)
+            rc = xmldb_set_uint64_t(static_cast<uint64_t>(f.number), path);
+        else
+            rc = xmldb_set_int32_t(static_cast<int32_t>(f.number), path);
+        if (rc == KORV_OK)
+            continue;
+        if (f.text)
+            DBG_AS(func, 0, f.fail, path, f.text);
+        else if (f.u64)
+            DBG_AS(func, 0, f.fail, path, static_cast<unsigned long long>(f.number));
+        else
+            DBG_AS(func, 0, f.fail, path, static_cast<int>(f.number));
+        return ERR_DB_WRITE;
+    }
+    return KORV_OK;
+}
+
+int xmldb_conf::remove_compact(const char *func, const char *root, int n, int max, const char *key,
+                               std::initializer_list<const char *> fields)
+{
+    int last = _cal_xmldb_id_entry_count(root, max, key);
+    char path[kPathLen];
+    if (last > n) {
+        for (const char *field : fields) {
+            char value[kKeyLen] = "";
+            if (xmldb_get_cstring(value, sizeof value, entry_path(path, root, last, field)) != KORV_OK ||
+                xmldb_set_cstring(value, entry_path(path, root, n, field)) != KORV_OK) {
+                DBG_AS(func, 0, "del node %s failed", path);
+                return ERR_DB_WRITE;
+            }
+        }
+        n = last;
+    }
+    pathf(path, sizeof path, "%s/id:%d", root, n);
+    if (xmldb_delete_node(path) != KORV_OK) {
+        DBG_AS(func, 0, "del node %s failed", path);
         return ERR_DB_WRITE;
     }
     return KORV_OK;

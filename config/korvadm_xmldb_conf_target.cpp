@@ -16,21 +16,7 @@ constexpr const char *kStatusInactive = "Inactive";
 
 int xmldb_conf::find_target(const char *func, const char *name)
 {
-    int n = 0;
-    int rc = _search_xmldb_id_entry(&n, kTargetRoot, CONF_MAX_TARGETS, "name", name);
-    switch (rc) {
-    case ID_ENTRY_FOUND:
-        return n;
-    case ERR_PARAM:
-        DBG_AS(func, 0, "_search_xmldb_id_entry failed");
-        return ERR_DB_WRITE;
-    case ID_ENTRY_NOT_FOUND:
-        DBG_AS(func, 2, "can not find %s in xmldb target entry", name);
-        return ERR_NOT_FOUND;
-    default:
-        DBG_AS(func, 0, "IT SHOULD NEVER BE HERE, func_ret = %d", rc);
-        return ERR_DB_WRITE;
-    }
+    return find_entry(func, kTargets, name, "can not find %s in xmldb target entry", 2);
 }
 
 namespace {
@@ -114,18 +100,7 @@ int xmldb_check_target_exist(const char *name)
 int xmldb_check_add_target(const char *name)
 {
     PARAM_ERROR_IF(!name || !name[0]);
-    for (int n = 1; n <= CONF_MAX_TARGETS; n++) {
-        char path[kPathLen];
-        char got[kPathLen] = "";
-        target_path(path, n, "name");
-        if (xmldb_get_cstring(got, sizeof got, path) != KORV_OK || !got[0]) {
-            DBG(1, "xmldbc_get(%s) failed", path);
-            return 0;
-        }
-        if (std::strcmp(got, name) == 0)
-            return 1;
-    }
-    return ERR_NO_ROOM;
+    return check_entry(__func__, kTargetRoot, CONF_MAX_TARGETS, "name", name);
 }
 
 int xmldb_add_new_target(target_conf_t *conf)
@@ -238,28 +213,7 @@ int xmldb_set_target_hba_id(int hba_id, const char *name) { return set_target_in
 int xmldb_get_free_target_hba_id(int *hba_id)
 {
     PARAM_ERROR_IF(!hba_id);
-    bool used[CONF_MAX_TARGETS] = {};
-    // One past the capacity, so a list that somehow holds more still stops.
-    for (int n = 1; n <= CONF_MAX_TARGETS + 1; n++) {
-        char path[kPathLen];
-        int32_t v = 0;
-        if (xmldb_get_int32_t(&v, target_path(path, n, "hba_id")) != KORV_OK) {
-            DBG(2, "get free devid break at %d", n);
-            break;
-        }
-        if (v >= 0 && v < CONF_MAX_TARGETS)
-            used[v] = true;
-    }
-    for (int id = 0; id < CONF_MAX_TARGETS; id++) {
-        if (!used[id]) {
-            *hba_id = id;
-            DBG(2, "get free hba_id: %d", id);
-            return KORV_OK;
-        }
-    }
-    *hba_id = -1;
-    DBG(0, "can not get free devid");
-    return ERR_NO_ROOM;
+    return free_number(__func__, kTargetRoot, "hba_id", CONF_MAX_TARGETS, hba_id, "get free hba_id: %d");
 }
 
 int xmldb_get_target_iqn(char *buf, size_t size, const char *name)

@@ -12,8 +12,17 @@
 
 namespace korv_test {
 
+// A sample database tree under tests/config/data.
+inline std::string data_file(const char *name)
+{
+    return std::string(KORV_CONFIG_DATA) + "/" + name;
+}
+
 class StoreTest : public ::testing::Test {
 protected:
+    // The service starts with an empty tree, or with the tree of load_file.
+    explicit StoreTest(std::string load_file = {}) : db_(false, std::move(load_file)) {}
+
     // Raw value at path ("" when absent); fails the test when the service does not answer.
     static std::string raw(const std::string &path)
     {

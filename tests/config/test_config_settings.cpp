@@ -163,8 +163,8 @@ TEST(OperationsTable, SlotsSitAtTheirFixedPlacesAndOnlyProvidedOnesAreSet)
     constexpr size_t first = offsetof(iscsi_conf_ops_t, xmldb_get_service_enable);
     EXPECT_EQ(iscsi_conf_ops.conf_type, 1);
 
-    const int provided[][2] = {{1, 17},  {21, 27}, {29, 31},   {38, 40},  {44, 49},
-                               {52, 52}, {96, 96}, {106, 113}, {115, 119}};
+    const int provided[][2] = {{1, 17},  {21, 27}, {29, 31},  {38, 40},   {44, 50},   {52, 57},
+                               {59, 70}, {73, 73}, {75, 92},  {94, 99},   {101, 103}, {106, 119}};
     for (int k = 1; k <= 119; k++) {
         uintptr_t v = 0;
         std::memcpy(&v, reinterpret_cast<const char *>(&iscsi_conf_ops) + first + (k - 1) * sizeof(void *), sizeof v);

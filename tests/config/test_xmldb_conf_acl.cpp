@@ -1,0 +1,160 @@
+// ACLs: initiators, rights kept on both sides, their removal, the readers,
+// and the session access records.
+#include <string>
+
+#include <gtest/gtest.h>
+
+#include "common/korvadm_err.h"
+#include "config/korvadm_xmldb_conf.h"
+#include "tests/config/store_fixture.h"
+
+using korv_test::quiet;
+using korv_test::StoreTest;
+
+namespace {
+
+class Acl : public StoreTest {
+protected:
+    void SetUp() override
+    {
+        for (int n = 1; n <= 3; n++)
+            put("/iscsi/lun/id:" + std::to_string(n) + "/name", "l" + std::to_string(n));
+    }
+    // Both sides as text: per initiator "iqn(alias)=lun:right,...", then per
+    // LUN "lun=iqn:right,...", each list with its stored count.
+    static std::string sides()
+    {
+        std::string out;
+        for (int a = 1; a <= 4; a++) {  // across a gap a delete left
+            if (raw(e("/iscsi/acl", a) + "/initiator").empty())
+                continue;
+            out += raw(e("/iscsi/acl", a) + "/initiator") + "(" + raw(e("/iscsi/acl", a) + "/alias") + ")=";
+            out += list(e("/iscsi/acl", a) + "/mapped_lun", "lun_name") + " ";
+        }
+        for (int l = 1; l <= 3; l++)
+            out += "l" + std::to_string(l) + "=" + list(e("/iscsi/lun", l) + "/acl", "initiator") + " ";
+        return out;
+    }
+    static std::string e(const std::string &root, int n) { return root + "/id:" + std::to_string(n); }
+    static std::string list(const std::string &root, const char *key)
+    {
+        std::string out;
+        for (int n = 1; !raw(e(root, n) + "/" + key).empty(); n++)
+            out += raw(e(root, n) + "/" + key) + ":" + raw(e(root, n) + "/access_right") + ",";
+        return out + "#" + raw(root + "/count");
+    }
+};
+
+}  // namespace
+
+TEST_F(Acl, GrantingAddsAnUnknownInitiatorAndWritesBothSides)
+{
+    EXPECT_EQ(iscsi_conf_ops.xmldb_set_lun_acl("iqn.a", "A", "l1", 2), KORV_OK);
+    EXPECT_EQ(xmldb_set_lun_acl("iqn.a", "A", "l2", 0), KORV_OK);
+    EXPECT_EQ(xmldb_set_lun_acl("iqn.b", "B", "l2", 1), KORV_OK);
+    EXPECT_EQ(xmldb_set_lun_acl("iqn.a", "A", "l1", 1), KORV_OK);  // a change, not a second entry
+    EXPECT_EQ(sides(), "iqn.a(A)=l1:RO,l2:DENY,#2 iqn.b(B)=l2:RO,#1 l1=iqn.a:RO,#1 l2=iqn.a:DENY,iqn.b:RO,#2 l3=# ");
+    EXPECT_EQ(raw("/iscsi/acl/count"), "2");
+    EXPECT_EQ(xmldb_check_acl_initiaor_exist("iqn.b"), 1);
+    EXPECT_EQ(xmldb_check_acl_alias_exist("B"), 1);
+    EXPECT_EQ(xmldb_check_add_acl_initiator("iqn.c", "C"), 0);
+    EXPECT_EQ(xmldb_check_add_acl_initiator("iqn.c", "A"), 1);
+    char buf[CONF_IQN_LEN];
+    EXPECT_EQ(xmldb_get_initiator_name_from_alias(buf, sizeof buf, "B"), KORV_OK);
+    EXPECT_STREQ(buf, "iqn.b");
+    EXPECT_EQ(xmldb_get_initiator_name_from_alias(buf, 5, "B"), KORV_OK);  // does not fit: none
+    EXPECT_STREQ(buf, "");
+
+    // Refused grants write nothing, not even the initiator.
+    struct {
+        int rc;
+        const char *initiator, *lun, *message;
+        int right;
+    } refused[] = {
+        {ERR_PARAM, "iqn.c", "l1", "access right error", 3},
+        {ERR_PARAM, "", "l1", "initiator name error", 1},
+        {ERR_PARAM, "iqn.c", "", "lun name error", 1},
+        {ERR_PARAM, "iqn.c", "l9", "lun name not exist", 1},
+    };
+    const std::string before = sides();
+    for (const auto &r : refused) {
+        std::string out;
+        EXPECT_EQ(quiet([&] { return xmldb_set_lun_acl(r.initiator, "C", r.lun, r.right); }, &out), r.rc);
+        EXPECT_NE(out.find(r.message), std::string::npos) << out;
+    }
+    EXPECT_EQ(sides(), before);
+}
+
+TEST_F(Acl, RemovalsKeepBothSidesInAgreement)
+{
+    for (const char *i : {"iqn.a", "iqn.b", "iqn.c"})
+        for (const char *l : {"l1", "l2"})
+            ASSERT_EQ(quiet([&] { return xmldb_set_lun_acl(i, i + 4, l, 2); }), KORV_OK);
+    EXPECT_EQ(xmldb_del_acl_initiator("iqn.a"), KORV_OK);
+    EXPECT_EQ(sides(), "iqn.b(b)=l1:RW,l2:RW,#2 iqn.c(c)=l1:RW,l2:RW,#2 "
+                       "l1=iqn.c:RW,iqn.b:RW,#2 l2=iqn.c:RW,iqn.b:RW,#2 l3=# ");
+    EXPECT_EQ(raw("/iscsi/acl/count"), "2");
+
+    // The initiator's own entry leaves a gap, which the next new initiator fills.
+    ASSERT_EQ(quiet([] { return xmldb_set_lun_acl("iqn.a", "a", "l1", 1); }), KORV_OK);
+    EXPECT_EQ(xmldb_remove_lun_from_all_acl("l1"), KORV_OK);
+    EXPECT_EQ(sides(), "iqn.a(a)=#0 iqn.b(b)=l2:RW,#1 iqn.c(c)=l2:RW,#1 l1=# l2=iqn.c:RW,iqn.b:RW,#2 l3=# ");
+
+    // Half-written pairs are reported and passed over.
+    put("/iscsi/lun/id:2/acl/id:1/initiator", "iqn.a");  // a has no l2 on its side
+    std::string out;
+    EXPECT_EQ(quiet([] { return xmldb_remove_lun_from_all_acl("l2"); }, &out), KORV_OK);
+    EXPECT_NE(out.find("error l2 is not exist on initiator iqn.a, the acl might be inconsistency"), std::string::npos)
+        << out;
+    EXPECT_EQ(quiet([] { return xmldb_del_acl_initiator("iqn.c"); }, &out), KORV_OK);  // l2's side is gone
+    EXPECT_NE(out.find("error iqn.c is not exist on lun l2, the acl might be inconsistency"), std::string::npos) << out;
+    EXPECT_EQ(sides(), "iqn.a(a)=#0 iqn.b(b)=#0 l1=# l2=# l3=# ");
+    EXPECT_EQ(quiet([] { return xmldb_del_acl_initiator("iqn.nobody"); }), ERR_NOT_FOUND);
+}
+
+TEST_F(Acl, ReadersAndTheInitiatorLimit)
+{
+    ASSERT_EQ(xmldb_set_lun_acl("iqn.a", "A", "l1", 2), KORV_OK);
+    ASSERT_EQ(xmldb_set_lun_acl("iqn.b", "B", "l1", 0), KORV_OK);
+    list_t list;
+    list_init(&list);
+    ASSERT_EQ(xmldb_get_all_lun_acl_conf_from_lun("l1", &list), KORV_OK);
+    std::string got;
+    for (lun_acl_conf_t *r : korv::list_records<lun_acl_conf_t>(&list))
+        got += std::string(r->initiator) + "/" + r->alias + "/" + std::to_string(r->access_right) + " ";
+    lun_acl_conf_free_list(&list);
+    EXPECT_EQ(got, "iqn.a/A/2 iqn.b/B/0 ");
+    EXPECT_EQ(quiet([&] { return xmldb_get_all_lun_acl_conf_from_lun("l9", &list); }), ERR_NOT_FOUND);
+
+    for (int a = 3; a <= 129; a++) {
+        put("/iscsi/acl/id:" + std::to_string(a) + "/initiator", "iqn.n" + std::to_string(a));
+        put("/iscsi/acl/id:" + std::to_string(a) + "/alias", "n" + std::to_string(a));
+    }
+    ASSERT_EQ(xmldb_get_all_acl_initiator_conf_lite(&list), KORV_OK);
+    EXPECT_EQ(list.count, 129);
+    auto *last = static_cast<acl_initiator_conf_t *>(list.tail->owner);
+    EXPECT_EQ(std::string(last->initiator) + "/" + last->alias + "/" + std::to_string(last->dbidx), "iqn.n129/n129/129");
+    acl_initiator_conf_free_list(&list);
+
+    std::string out;
+    EXPECT_EQ(quiet([] { return xmldb_set_lun_acl("iqn.new", "N", "l2", 1); }, &out), ERR_NO_ROOM);
+    EXPECT_NE(out.find("the maximum number of targets has reached"), std::string::npos) << out;
+    EXPECT_EQ(raw("/iscsi/acl/id:130/initiator") + raw("/iscsi/lun/id:2/acl/id:1/initiator"), "");
+}
+
+TEST_F(Acl, SessionAccessIsRecordedPerInitiatorAndLun)
+{
+    EXPECT_EQ(iscsi_conf_ops.xmldb_update_sess_acl_lun_access_status("iqn.a", "l1", 3), KORV_OK);
+    EXPECT_EQ(xmldb_update_sess_acl_lun_access_status("iqn.b", "l1", 4), KORV_OK);
+    EXPECT_EQ(xmldb_update_sess_acl_lun_access_status("iqn.a", "l2", 4294967295u), KORV_OK);
+    EXPECT_EQ(xmldb_update_sess_acl_lun_access_status("iqn.a", "l1", 0), KORV_OK);
+    const std::string s = "/iscsi/sess/initiator";
+    EXPECT_EQ(raw(s + "/count") + raw(s + "/id:1/name") + raw(s + "/id:2/name"), "2iqn.aiqn.b");
+    EXPECT_EQ(list(s + "/id:1/access_lun", "lun_name"), "l1:,l2:,#2");
+    EXPECT_EQ(raw(s + "/id:1/access_lun/id:1/access_status") + "/" + raw(s + "/id:1/access_lun/id:2/access_status"),
+              "0/4294967295");
+    EXPECT_EQ(quiet([] { return xmldb_update_sess_acl_lun_access_status(nullptr, "l1", 0); }), ERR_PARAM);
+    EXPECT_EQ(xmldb_clean_sess_conf(), KORV_OK);
+    EXPECT_EQ(xmldb_clean_acl_conf(), KORV_OK);
+    EXPECT_EQ(raw(s + "/id:1/name") + raw("/iscsi/acl/id:1/initiator"), "");
+}
