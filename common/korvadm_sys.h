@@ -1,13 +1,18 @@
 /* System information: network addresses and the host name in IQN form
- * (network half); volumes and disks (storage half, later).
+ * (network half, korvadm_sys.cpp); volumes and disks (storage half,
+ * korvadm_sys_storage.cpp).
  *
  * Addresses come from the network settings under "/network_mgr" in the
  * configuration database, link state from the platform's
- * LIB_Get_Lan_Link_Speed, the host name from sys_hostname. */
+ * LIB_Get_Lan_Link_Speed, the host name from sys_hostname. Volumes, RAIDs and
+ * disks come from the system-information database ("/var/run/xmldb_sock_sysinfo",
+ * keys in docs/sysinfo.md); mount points are confirmed with sys_mount_point,
+ * room is measured with "df", disk sleep is asked of "powermgmt -s". */
 #ifndef KORVADM_SYS_H
 #define KORVADM_SYS_H
 
 #include <stddef.h>
+#include <stdint.h>
 
 #include "common/korvadm_list.h"
 
@@ -66,6 +71,107 @@ int sys_net_get_host_name_in_iqn_spec(char *out, size_t size, int refresh);
 /* LAN 1's MAC address as "xx:xx:xx:xx:xx:xx" (out holds 18 bytes). 0; -9981
  * when it cannot be read; -9989 for NULL. */
 int sys_net_get_lan1_mac_str(char *out);
+
+/* ---- volumes and disks ---- */
+
+#define VOL_MNT_PATH_LEN 256
+#define VOL_UUID_LEN     128
+/* Counts read from the system-information database are clamped to this. */
+#define SYSINFO_MAX_ENTRIES 256
+
+/* One volume as the configuration store's summaries see it. */
+typedef struct vol_info_s {
+    char mnt_path[VOL_MNT_PATH_LEN];
+    char uuid[VOL_UUID_LEN];
+    uint64_t vol_size;          /* bytes */
+    uint64_t alloc_size;        /* space allocated to LUNs */
+    uint64_t claim_alloc_size;  /* space claimed by LUNs (their apparent size) */
+    uint64_t free_size;         /* free space as measured */
+    uint64_t claim_free_size;   /* free space once claims are met */
+    /* Set when the caller's figures are final: the summaries rewrite then
+     * does not carry over the stored allocation. */
+    int keep_figures;
+    list_node_t node;           /* owner is the entry */
+} vol_info_t;
+
+/* A zeroed entry, node owned by it; NULL ("malloc vol_info_t failed") when
+ * out of memory. */
+vol_info_t *vol_info_new(void);
+/* Unlinks and frees; NULL is ignored. */
+void vol_info_free(vol_info_t *vol);
+void vol_info_free_list(list_t *list);
+
+/* One volume with its room figures, in a chain through `next`. */
+typedef struct vol_lun_info_s {
+    char vol_mnt_path[VOL_MNT_PATH_LEN];
+    char uuid[VOL_UUID_LEN];
+    /* The LUN code's three figures for this volume: space allocated, space
+     * claimed, and one more it keeps here. */
+    uint64_t lun_alloc_size;
+    uint64_t lun_claim_size;
+    uint64_t lun_extra_size;
+    uint64_t vol_size;        /* total, as df shares it */
+    uint64_t free_size;       /* current free figure */
+    uint64_t init_free_size;  /* free figure when measured */
+    int hibernation;          /* 1 when a member disk sleeps */
+    struct vol_lun_info_s *next;
+} vol_lun_info_t;
+
+/* Number of disks ("/disks/disk#") / volumes ("/vols/vol#"), clamped to
+ * 0..SYSINFO_MAX_ENTRIES; 0 when unreadable, negative or not a number. */
+int xmldb_get_disk_cnt(void);
+int xmldb_get_vol_cnt(void);
+/* 1-based index of the RAID whose "dev" is md_dev / of the disk named name;
+ * 0 when absent (logged). */
+int xmldb_get_md_dbidx_by_md_dev(const char *md_dev);
+int xmldb_get_disk_dbidx_by_name(const char *name);
+/* The member list text of RAID raid_idx into out. 0; -9980 when empty or
+ * unreadable; -9989 for bad arguments. */
+int xmldb_get_md_raid_disks(int raid_idx, char *out, size_t size);
+
+/* Mount path of the volume with that UUID, when it is mounted. Every volume
+ * is looked at (the scan ends at the first empty name), so with duplicate
+ * UUIDs the last mounted one wins. 5 found (out set); 6 not found (out "");
+ * -9989 for NULL arguments or size 0. */
+int sys_raid_get_mnt_path_by_uuid(char *out, size_t size, const char *uuid);
+/* 10 when the first volume with that UUID is mounted (unlocked), 9 when it is
+ * not, is absent, or uuid is ""; -9989 for NULL. */
+int sys_raid_vol_is_unlocked_by_uuid(const char *uuid);
+
+/* Asks "powermgmt -s" which disks sleep: *states gets a malloc'd array of
+ * disk_cnt ints (1 asleep; the caller frees it) where disk i (from 0) sleeps
+ * when bit i % 32 of the reported mask is set. A missing "result: " marker
+ * means all awake. Returns the number of awake disks, or -1 when the command
+ * cannot be run or fails, or for bad arguments. */
+int powermgmt_get_hibernate_status(int **states, int disk_cnt);
+/* 1 when a member disk of volume vol_idx's RAID sleeps (states as filled
+ * above, disk_cnt entries), 0 when none does; -9981 when the volume's device
+ * is unreadable, -9998 when its RAID or member list is not found, -9989 for
+ * bad arguments. */
+int xmldb_get_vol_hibernation(int vol_idx, int disk_cnt, const int *states);
+
+/* Frees every record of the chain and sets *head NULL. */
+void vol_lun_info_list_deinit(vol_lun_info_t **head);
+/* The record with that UUID after adding the three increments to its figures
+ * (a claim growing beyond the allocation lowers the free figure, never below
+ * 0) and storing flag unless it is negative; a new record
+ * (_vol_info_list_insert) when none has that UUID. NULL when it cannot be
+ * added. */
+vol_lun_info_t *vol_lun_info_update(vol_lun_info_t **head, const char *uuid, uint64_t alloc_inc,
+                                    uint64_t claim_inc, uint64_t extra_inc, int flag);
+/* Record n (from 0) of the chain, remembering n + 1; a negative n continues
+ * from the remembered position. The position is process-wide: not
+ * thread-safe, meant for one walk at a time. NULL past the end. */
+vol_lun_info_t *vol_lun_info_list_get_nth(vol_lun_info_t *head, int n);
+/* Adds a record for every mounted volume to the chain, each with its room
+ * and hibernation flag (asking "powermgmt -s" when check is 1, else taking
+ * every disk as asleep). 0; 1 when there are no disks; -1 or the failing
+ * step's code otherwise. */
+int init_root_vol_lun_info(vol_lun_info_t **head, int check);
+/* Appends one vol_info_t (mount path and UUID, figures 0) per volume to an
+ * empty list, all or none. 0; -9989 for NULL or a non-empty list; -9987
+ * when out of memory. */
+int get_vol_info_list(list_t *list);
 
 #ifdef __cplusplus
 }
