@@ -218,6 +218,23 @@ int xmldb_save_conf(void);
 int xmldb_clean_conf(void);
 int xmldb_set_temp_return_code(int code);
 
+/* ---- volume summaries under "/iscsi/lun/total_size" ---- */
+
+/* Number (>= 1) of the summary of the volume with that UUID; -1 when none
+ * has it, -9981 when the count or a listed entry cannot be read, -9989 for
+ * NULL. */
+int xmldb_get_vol_lun_info_idx_by_uuid(const char *uuid);
+/* Rewrites the summaries from a list of vol_info_t (common/korvadm_sys.h):
+ * each volume without keep_figures takes the non-zero allocation of its old
+ * summary, and its claimed-free figure from its free figure; then the
+ * summaries are replaced, numbered from 1 in list order, with the count and
+ * both totals. Deletes and writes are tried 3 times; -9981 when they keep
+ * failing (what was written stays). 0 on success. */
+int xmldb_update_total_vol_size_info(list_t *volumes);
+/* "/iscsi/lun/total_size/total_alloc_size" and ".../total_size". 0 / -9981. */
+int xmldb_set_lun_total_alloc_size(uint64_t size);
+int xmldb_set_lun_total_apparent_size(uint64_t size);
+
 #ifdef __cplusplus
 }
 #endif

@@ -1,0 +1,111 @@
+// The per-volume summaries under "/iscsi/lun/total_size": lookup by UUID and
+// the rewrite from a volume list, checked against whole dumps of the store.
+#include <cstdio>
+#include <cstring>
+#include <fstream>
+#include <sstream>
+#include <string>
+
+#include <gtest/gtest.h>
+
+#include "common/korvadm_err.h"
+#include "common/korvadm_sys.h"
+#include "config/korvadm_conf.h"
+#include "config/korvadm_xmldb_conf.h"
+#include "tests/config/store_fixture.h"
+
+using korv_test::quiet;
+
+namespace {
+
+const std::string kData = KORV_CONFIG_DATA;
+
+std::string data_text(const std::string &name)
+{
+    std::ifstream in(kData + "/" + name);
+    std::string out;
+    for (std::string l; std::getline(in, l);)
+        if (!l.empty() && l[0] != '#')
+            out += l + "\n";
+    EXPECT_FALSE(out.empty()) << name;
+    return out;
+}
+
+class VolSummaries : public korv_test::StoreTest {
+protected:
+    void SetUp() override
+    {
+        std::istringstream in(data_text("vol_summaries_before.txt"));
+        for (std::string l; std::getline(in, l);)
+            put(l.substr(0, l.find(" = ")), l.substr(l.find(" = ") + 3));
+        list_init(&vols_);
+    }
+    void TearDown() override { vol_info_free_list(&vols_); }
+
+    void load_volumes()
+    {
+        std::istringstream in(data_text("vol_summaries_volumes.txt"));
+        for (std::string l; std::getline(in, l);) {
+            vol_info_t *v = vol_info_new();
+            ASSERT_NE(v, nullptr);
+            std::istringstream f(l);
+            f >> v->uuid >> v->mnt_path >> v->vol_size >> v->alloc_size >> v->claim_alloc_size >> v->free_size >>
+                v->claim_free_size >> v->keep_figures;
+            list_append(&v->node, &vols_);
+        }
+    }
+    // "path = value" lines of the subtree, in the store's order.
+    static std::string dump(const std::string &path)
+    {
+        std::string out, cmd = korv_test::xmldbc_binary() + " dump " + path;
+        if (std::FILE *p = popen(cmd.c_str(), "r")) {
+            char line[512];
+            while (std::fgets(line, sizeof line, p))
+                if (std::strstr(line, " = "))
+                    out += line;
+            pclose(p);
+        }
+        return out;
+    }
+
+    list_t vols_;
+};
+
+TEST_F(VolSummaries, FoundByUuid)
+{
+    EXPECT_EQ(xmldb_get_vol_lun_info_idx_by_uuid("u-b"), 2);
+    EXPECT_EQ(quiet([] { return xmldb_get_vol_lun_info_idx_by_uuid("u-x"); }), -1);
+    EXPECT_EQ(quiet([] { return xmldb_get_vol_lun_info_idx_by_uuid(nullptr); }), ERR_PARAM);
+    put("/iscsi/lun/total_size/count", "5");  // entry 5 is missing
+    EXPECT_EQ(quiet([] { return xmldb_get_vol_lun_info_idx_by_uuid("u-x"); }), ERR_DB_WRITE);
+    put("/iscsi/lun/total_size/count", "");
+    EXPECT_EQ(quiet([] { return xmldb_get_vol_lun_info_idx_by_uuid("u-a"); }), -1);
+}
+
+TEST_F(VolSummaries, RewriteKeepsStoredAllocationsAndTotals)
+{
+    load_volumes();
+    EXPECT_EQ(quiet([&] { return iscsi_conf_ops.xmldb_update_total_vol_size_info(&vols_); }), 0);
+    EXPECT_EQ(dump("/iscsi/lun"), data_text("vol_summaries_after.txt"));
+}
+
+TEST_F(VolSummaries, EmptyListLeavesCountAndTotalsZero)
+{
+    EXPECT_EQ(quiet([&] { return xmldb_update_total_vol_size_info(&vols_); }), 0);
+    EXPECT_EQ(dump("/iscsi/lun"), data_text("vol_summaries_empty.txt"));
+}
+
+TEST_F(VolSummaries, FailingWritesGiveUpAfterThreeAttempts)
+{
+    load_volumes();
+    db().stop();
+    std::string log;
+    EXPECT_EQ(quiet([&] { return xmldb_update_total_vol_size_info(&vols_); }, &log), ERR_DB_WRITE);
+    size_t attempts = 0;
+    for (size_t at = 0; (at = log.find("xmldbc_set(/iscsi/lun/total_size/id:1/uuid) failed \n", at)) != std::string::npos;
+         ++at)
+        ++attempts;
+    EXPECT_EQ(attempts, 3u) << log;
+}
+
+}  // namespace
