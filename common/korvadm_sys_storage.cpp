@@ -538,7 +538,7 @@ int init_root_vol_lun_info(vol_lun_info_t **head, int check)
             return awake;
         }
     }
-    korv::c_buffer states_owner(reinterpret_cast<char *>(states));
+    std::unique_ptr<int, korv::free_deleter> states_owner(states);
     int vols = xmldb_get_vol_cnt();
     if (vols < 0) {
         DBG(0, "get volume count from xmldb failed");
@@ -580,29 +580,23 @@ int get_vol_info_list(list_t *list)
         return ERR_PARAM;
     }
     DBG(2, "start get_vol_info_list");
-    list_t fresh;
-    list_init(&fresh);
-    int rc = KORV_OK;
-    for_each_volume([&](int idx) {
-        vol_info_t *vol = vol_info_new();
-        if (!vol) {
-            rc = ERR_NO_MEMORY;
-            return false;
-        }
-        vol_get(vol->uuid, idx, "uuid");
-        vol_get(vol->mnt_path, idx, "mnt");
-        list_append(&vol->node, &fresh);
-        return true;
+    int rc = korv::fill_and_hand_over(list, vol_info_free_list, [](list_t *got) {
+        int fill_rc = KORV_OK;
+        for_each_volume([&](int idx) {
+            vol_info_t *vol = vol_info_new();
+            if (!vol) {
+                fill_rc = ERR_NO_MEMORY;
+                return false;
+            }
+            vol_get(vol->uuid, idx, "uuid");
+            vol_get(vol->mnt_path, idx, "mnt");
+            list_append(&vol->node, got);
+            return true;
+        });
+        return fill_rc;
     });
-    if (rc != KORV_OK) {
-        vol_info_free_list(&fresh);
+    if (rc != KORV_OK)
         return rc;
-    }
-    // Hand the entries over whole: the caller never sees half a list.
-    for (vol_info_t *vol : korv::list_records<vol_info_t>(&fresh)) {
-        list_remove(&vol->node);
-        list_append(&vol->node, list);
-    }
     DBG(2, "finish get_vol_info_list");
     return KORV_OK;
 }

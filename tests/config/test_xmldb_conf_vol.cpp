@@ -4,13 +4,11 @@
 #include <cstring>
 #include <fstream>
 #include <sstream>
-#include <string>
 
 #include <gtest/gtest.h>
 
 #include "common/korvadm_err.h"
 #include "common/korvadm_sys.h"
-#include "config/korvadm_conf.h"
 #include "config/korvadm_xmldb_conf.h"
 #include "tests/config/store_fixture.h"
 
@@ -18,16 +16,27 @@ using korv_test::quiet;
 
 namespace {
 
-const std::string kData = KORV_CONFIG_DATA;
-
-std::string data_text(const std::string &name)
+// A data file's lines without comments.
+std::string data(const std::string &name)
 {
-    std::ifstream in(kData + "/" + name);
+    std::ifstream in(KORV_CONFIG_TEST_DATA "/" + name);
     std::string out;
     for (std::string l; std::getline(in, l);)
         if (!l.empty() && l[0] != '#')
             out += l + "\n";
-    EXPECT_FALSE(out.empty()) << name;
+    return out;
+}
+
+// The "path = value" lines of the store's subtree, in the store's order.
+std::string dump(const std::string &path)
+{
+    std::string out;
+    std::FILE *p = popen((korv_test::xmldbc_binary() + " dump " + path).c_str(), "r");
+    for (char l[512]; p && std::fgets(l, sizeof l, p);)
+        if (std::strstr(l, " = "))
+            out += l;
+    if (p)
+        pclose(p);
     return out;
 }
 
@@ -35,39 +44,19 @@ class VolSummaries : public korv_test::StoreTest {
 protected:
     void SetUp() override
     {
-        std::istringstream in(data_text("vol_summaries_before.txt"));
+        std::istringstream in(data("vol_summaries_before.txt")), vols(data("vol_summaries_volumes.txt"));
         for (std::string l; std::getline(in, l);)
             put(l.substr(0, l.find(" = ")), l.substr(l.find(" = ") + 3));
         list_init(&vols_);
-    }
-    void TearDown() override { vol_info_free_list(&vols_); }
-
-    void load_volumes()
-    {
-        std::istringstream in(data_text("vol_summaries_volumes.txt"));
-        for (std::string l; std::getline(in, l);) {
+        for (std::string l; std::getline(vols, l);) {
             vol_info_t *v = vol_info_new();
             ASSERT_NE(v, nullptr);
-            std::istringstream f(l);
-            f >> v->uuid >> v->mnt_path >> v->vol_size >> v->alloc_size >> v->claim_alloc_size >> v->free_size >>
-                v->claim_free_size >> v->keep_figures;
+            std::istringstream(l) >> v->uuid >> v->mnt_path >> v->vol_size >> v->alloc_size >> v->claim_alloc_size >>
+                v->free_size >> v->claim_free_size >> v->keep_figures;
             list_append(&v->node, &vols_);
         }
     }
-    // "path = value" lines of the subtree, in the store's order.
-    static std::string dump(const std::string &path)
-    {
-        std::string out, cmd = korv_test::xmldbc_binary() + " dump " + path;
-        if (std::FILE *p = popen(cmd.c_str(), "r")) {
-            char line[512];
-            while (std::fgets(line, sizeof line, p))
-                if (std::strstr(line, " = "))
-                    out += line;
-            pclose(p);
-        }
-        return out;
-    }
-
+    void TearDown() override { vol_info_free_list(&vols_); }
     list_t vols_;
 };
 
@@ -84,20 +73,15 @@ TEST_F(VolSummaries, FoundByUuid)
 
 TEST_F(VolSummaries, RewriteKeepsStoredAllocationsAndTotals)
 {
-    load_volumes();
     EXPECT_EQ(quiet([&] { return iscsi_conf_ops.xmldb_update_total_vol_size_info(&vols_); }), 0);
-    EXPECT_EQ(dump("/iscsi/lun"), data_text("vol_summaries_after.txt"));
-}
-
-TEST_F(VolSummaries, EmptyListLeavesCountAndTotalsZero)
-{
+    EXPECT_EQ(dump("/iscsi/lun"), data("vol_summaries_after.txt"));
+    vol_info_free_list(&vols_);
     EXPECT_EQ(quiet([&] { return xmldb_update_total_vol_size_info(&vols_); }), 0);
-    EXPECT_EQ(dump("/iscsi/lun"), data_text("vol_summaries_empty.txt"));
+    EXPECT_EQ(dump("/iscsi/lun"), data("vol_summaries_empty.txt"));
 }
 
 TEST_F(VolSummaries, FailingWritesGiveUpAfterThreeAttempts)
 {
-    load_volumes();
     db().stop();
     std::string log;
     EXPECT_EQ(quiet([&] { return xmldb_update_total_vol_size_info(&vols_); }, &log), ERR_DB_WRITE);
