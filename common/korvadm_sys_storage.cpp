@@ -18,7 +18,6 @@
 
 #include "common/korvadm_err.h"
 #include "common/korvadm_log.h"
-#include "common/korvadm_cmd.h"
 #include "common/korvadm_str.h"
 #include "common/korvadm_utils.h"
 #include "platform/platform_util.h"
@@ -343,7 +342,7 @@ int xmldb_get_vol_hibernation(int vol_idx, int disk_cnt, const int *states)
         DBG(0, "fail to search md dev : %s", dev);
         return ERR_SYSINFO;
     }
-    char members[1024];
+    char members[512];
     if (xmldb_get_md_raid_disks(md, members, sizeof members) != KORV_OK) {
         DBG(0, "fail to get raid_disks : %s", dev);
         return ERR_SYSINFO;

@@ -17,7 +17,6 @@
 #include <string>
 #include <string_view>
 
-#include "common/korvadm_cmd.h"
 #include "common/korvadm_str.h"
 #include "common/korvadm_sysroot.h"
 #include "platform/platform_util.h"
