@@ -13,13 +13,13 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <memory>
 #include <string>
 #include <string_view>
 
 #include "common/korvadm_err.h"
 #include "common/korvadm_log.h"
 #include "common/korvadm_str.h"
-#include "common/korvadm_utils.h"
 #include "platform/platform_util.h"
 #include "platform/xmldbc.h"
 
