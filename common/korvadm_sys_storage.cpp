@@ -525,7 +525,7 @@ int init_root_vol_lun_info(vol_lun_info_t **head, int check)
         return -1;
     }
     if (disks == 0) {
-        DBG(0, "disk count = 0");
+        DBG(1, "disk count = 0");
         return 1;
     }
     int *states = nullptr;
