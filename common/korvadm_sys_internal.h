@@ -2,6 +2,10 @@
 #ifndef KORVADM_SYS_INTERNAL_H
 #define KORVADM_SYS_INTERNAL_H
 
+/* Every file of the unit logs under the unit's name. */
+#undef KORV_LOG_UNIT
+#define KORV_LOG_UNIT "korvadm_sys"
+
 #include "common/korvadm_sys.h"
 
 #ifdef __cplusplus
