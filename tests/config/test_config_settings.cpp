@@ -164,7 +164,7 @@ TEST(OperationsTable, SlotsSitAtTheirFixedPlacesAndOnlyProvidedOnesAreSet)
     EXPECT_EQ(iscsi_conf_ops.conf_type, 1);
 
     const int provided[][2] = {{1, 17},  {21, 27}, {29, 31},  {38, 40},   {44, 50},   {52, 57},
-                               {59, 70}, {73, 73}, {75, 92},  {94, 99},   {101, 103}, {106, 119}};
+                               {59, 70}, {73, 73}, {75, 92},  {94, 99},   {101, 103}, {105, 119}};
     for (int k = 1; k <= 119; k++) {
         uintptr_t v = 0;
         std::memcpy(&v, reinterpret_cast<const char *>(&iscsi_conf_ops) + first + (k - 1) * sizeof(void *), sizeof v);
