@@ -1,6 +1,9 @@
-// The bounded copy and the shell escaping.
+// The bounded copy, the shell escaping and the reader of command output.
 #include "common/korvadm_str.h"
 
+#include <sys/wait.h>
+
+#include <cstdio>
 #include <cstring>
 #include <new>
 
@@ -40,6 +43,33 @@ bool shell_escape(const char *src, std::string &out)
         return false;
     }
     return true;
+}
+
+int read_command_lines(const char *cmd, const std::function<bool(std::string_view line)> &on_line)
+{
+    if (!cmd)
+        return -1;
+    std::fflush(stdout);
+    std::FILE *p = popen(cmd, "r");
+    if (!p)
+        return -1;
+    char *line = nullptr;
+    size_t cap = 0;
+    ssize_t n;
+    while ((n = getline(&line, &cap, p)) >= 0) {
+        std::string_view text(line, static_cast<size_t>(n));
+        if (!text.empty() && text.back() == '\n')
+            text.remove_suffix(1);
+        if (!on_line(text))
+            break;
+    }
+    std::free(line);
+    int status = pclose(p);
+    if (status == -1)
+        return -1;
+    if (WIFEXITED(status))
+        return WEXITSTATUS(status);
+    return WIFSIGNALED(status) ? 128 + WTERMSIG(status) : -1;
 }
 
 }  // namespace korv

@@ -1,5 +1,6 @@
 /* Small text and memory helpers every layer shares: the one bounded copy,
- * the one shell escaping and the one owner of malloc'd memory.
+ * the one shell escaping, the one reader of command output and the one owner
+ * of malloc'd memory.
  *
  * They sit in the base library so that the bundled platform (whose
  * str_insert_back_slash is the escaping the appliance's scripts know) and
@@ -12,6 +13,7 @@
 #ifdef __cplusplus
 #include <cstdlib>
 #include <cstring>
+#include <functional>
 #include <memory>
 #include <string>
 #include <string_view>
@@ -43,6 +45,15 @@ std::string shell_escape(std::string_view text);
 /* The same for a C string: false (out untouched) for NULL or when memory is
  * short. */
 bool shell_escape(const char *src, std::string &out);
+
+/* The one reader of commands whose output is parsed ("df", "powermgmt -s",
+ * "ps"): runs cmd through the shell (standard output flushed first) and
+ * hands each line of its standard output, without the line end, to on_line
+ * until on_line returns false. Returns the command's exit status as System()
+ * does (0..255, 128+N when it died of signal N; a command cut short by a
+ * false from on_line may die of SIGPIPE), or -1 when it could not be run.
+ * cmd is run as given: values in it must be escaped (shell_escape). */
+int read_command_lines(const char *cmd, const std::function<bool(std::string_view line)> &on_line);
 
 /* Memory from malloc/calloc/strdup, freed when it goes out of scope. */
 struct free_deleter {

@@ -131,15 +131,6 @@ struct file_closer {
     void operator()(std::FILE *f) const { std::fclose(f); }
 };
 using file_ptr = std::unique_ptr<std::FILE, file_closer>;
-
-/* The one reader of commands whose output is parsed ("df", "powermgmt -s",
- * "ps"): runs cmd through the shell (standard output flushed first) and
- * hands each line of its standard output, without the line end, to on_line
- * until on_line returns false. Returns the command's exit status as System()
- * does (0..255, 128+N when it died of signal N; a command cut short by a
- * false from on_line may die of SIGPIPE), or -1 when it could not be run.
- * cmd is run as given: values in it must be escaped (shell_escape). */
-int read_command_lines(const char *cmd, const std::function<bool(std::string_view line)> &on_line);
 }  // namespace korv
 #endif
 
