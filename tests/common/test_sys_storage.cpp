@@ -27,7 +27,7 @@ using U64s = std::vector<uint64_t>;
 namespace {
 
 namespace fs = std::filesystem;
-const std::string kData = KORV_COMMON_TEST_DATA;
+const std::string kData = KORV_TEST_DATA;
 
 // Data lines "<input> => <expected>", comments skipped.
 std::vector<std::pair<std::string, std::string>> cases(const std::string &name)

@@ -42,9 +42,9 @@ std::pair<std::string, int> powermgmt(const Disks &disks, const std::string &arg
 TEST(Powermgmt, MasksTheDisksInStandby)
 {
     korv_test::XmldbService db(korv_test::kWithSysinfo);
-    setenv("PATH", (std::string(KORV_PLATFORM_TEST_DATA) + ":" + std::getenv("PATH")).c_str(), 1);
+    setenv("PATH", (std::string(KORV_TEST_DATA) + ":" + std::getenv("PATH")).c_str(), 1);
     ASSERT_EQ(chdir(SysRoot::path().c_str()), 0);
-    std::ifstream in(std::string(KORV_PLATFORM_TEST_DATA) + "/powermgmt_disks.txt");
+    std::ifstream in(std::string(KORV_TEST_DATA) + "/powermgmt_disks.txt");
     for (std::string line; std::getline(in, line);) {
         if (line.empty() || line[0] == '#')
             continue;
