@@ -18,7 +18,9 @@
 #include "common/korvadm_err.h"
 #include "common/korvadm_sys_internal.h"
 #include "platform/xmldbc.h"
-#include "tests/config/store_fixture.h"
+#include "tests/support/capture.h"
+#include "tests/support/sysroot.h"
+#include "tests/support/xmldbd_fixture.h"
 
 using korv_test::quiet;
 using korv_test::SysRoot;

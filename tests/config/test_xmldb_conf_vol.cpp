@@ -19,7 +19,7 @@ namespace {
 // A data file's lines without comments.
 std::string data(const std::string &name)
 {
-    std::ifstream in(KORV_CONFIG_DATA "/" + name);
+    std::ifstream in(korv_test::data_file(name.c_str()));
     std::string out;
     for (std::string l; std::getline(in, l);)
         if (!l.empty() && l[0] != '#')
