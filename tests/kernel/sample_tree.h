@@ -1,8 +1,12 @@
 // Builds a sample configfs tree (tests/kernel/data/*.tree) under the kernel
-// tests' system root, with a target record naming its portal group.
+// tests' system root, with a target record naming its portal group. The one
+// fixture of the LIO back end's host tests.
 #pragma once
 
+#include <unistd.h>
+
 #include <cstdio>
+#include <filesystem>
 #include <fstream>
 #include <sstream>
 #include <string>
@@ -18,11 +22,18 @@ protected:
     {
         SysRootTest::SetUp();
         target = {};
-        set(target.iqn, "iqn.2026-01.test:t1");
+        set(target.iqn, IQN);
         set(target.alias, "t1");
         target.tpgt = 1;
     }
-    // Lines "d PATH" (a directory) and "f PATH TEXT" (a file); '#' comments.
+    void TearDown() override
+    {
+        iscsi_ip_free_list(&target.ip_list);
+        SysRootTest::TearDown();
+    }
+    // Lines "d PATH" (a directory), "f PATH TEXT" (a file, "\n" for a line
+    // end) and "l PATH TARGET" (a symbolic link to TARGET in the root), with
+    // parents made as needed; '#' comments.
     static void load_tree(const std::string &name)
     {
         std::ifstream in(std::string(KORV_KERNEL_DATA) + "/" + name);
@@ -36,8 +47,18 @@ protected:
             if (kind == "d")
                 mkdirs(at(path));
             else if (kind == "f")
-                write_file(at(path), text);
+                write_file(at(path), unescape(text));
+            else if (kind == "l") {
+                mkdirs(std::filesystem::path(at(path)).parent_path());
+                ASSERT_EQ(symlink(at(text).c_str(), at(path).c_str()), 0) << line;
+            }
         }
+    }
+    static std::string unescape(std::string text)
+    {
+        for (size_t nl; (nl = text.find("\\n")) != std::string::npos;)
+            text.replace(nl, 2, "\n");
+        return text;
     }
     template <size_t N>
     static void set(char (&field)[N], const std::string &text)
@@ -45,6 +66,7 @@ protected:
         std::snprintf(field, N, "%s", text.c_str());
     }
 
+    static constexpr const char *IQN = "iqn.2026-01.test:t1";
     static constexpr const char *TPG = "/sys/kernel/config/target/iscsi/iqn.2026-01.test:t1/tpgt_1";
     iscsi_target_t target;
 };

@@ -155,4 +155,16 @@ TEST_F(Lio4Storage, MappingChecksThenMakesTheLunLinkAndAluaSwitch)
     EXPECT_EQ(lio3_del_lun_mapping(&lun, &target), ERR_BACKSTORE_MISSING);
 }
 
+TEST_F(Lio4Storage, ShutdownNamesOneBackstoreAndTakesAnAbsentOneAsDone)
+{
+    set(lun.name, "../x");
+    EXPECT_EQ(lio3_shutdown_backstore(&lun), ERR_PARAM);
+    set(lun.name, "gone");
+    lun.hba_id = -1;
+    EXPECT_EQ(lio3_shutdown_backstore(&lun), ERR_PARAM);
+    lun.hba_id = 0;
+    EXPECT_EQ(lio3_shutdown_backstore(&lun), 0);
+    EXPECT_EQ(lio3_shutdown_backstore(nullptr), ERR_PARAM);
+}
+
 }  // namespace

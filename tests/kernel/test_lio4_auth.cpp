@@ -1,0 +1,48 @@
+// CHAP settings: password lengths, names, and mutual CHAP only with one-way.
+#include <string>
+
+#include "kernel/korvadm_mod_lio4_internal.h"
+#include "tests/kernel/sample_tree.h"
+#include "tests/support/capture.h"
+
+namespace {
+
+using Lio4Test = korv_test::SampleTree;
+
+TEST_F(Lio4Test, ChapPasswordLengthAndMutualOnlyWithOneWay)
+{
+    struct {
+        int chap, mutual;
+        const char *user, *pass, *muser, *mpass;
+        int valid;
+    } cases[] = {
+        {1, 0, "user", "elevenchars", "", "", 0},
+        {1, 0, "user", "twelve-chars", "", "", 1},
+        {1, 0, "user", "sixteen-chars-xx", "", "", 1},
+        {1, 0, "user", "seventeen-chars-x", "", "", 0},
+        {1, 0, "user", "", "", "", 0},
+        {1, 0, "", "twelve-chars", "", "", 0},
+        {1, 1, "user", "twelve-chars", "muser", "short", 0},
+        {1, 1, "user", "twelve-chars", "muser", "sixteen-chars-xx", 1},
+        {1, 1, "user", "twelve-chars", "", "sixteen-chars-xx", 0},
+        {0, 1, "", "", "", "short", 1},  // one-way off: mutual is not looked at
+    };
+    for (auto &c : cases) {
+        target.chap = c.chap;
+        target.mutual_chap = c.mutual;
+        std::strcpy(target.chap_user, c.user);
+        std::strcpy(target.chap_pass, c.pass);
+        std::strcpy(target.mutual_user, c.muser);
+        std::strcpy(target.mutual_pass, c.mpass);
+        EXPECT_EQ(_lio3_validate_target_chap_settings(&target), c.valid) << c.pass << " / " << c.mpass;
+    }
+    target.chap = 1;
+    target.mutual_chap = 0;
+    std::strcpy(target.chap_user, "user");
+    std::strcpy(target.chap_pass, "seventeen-chars-x");
+    std::string log = korv_test::capture_stdout([&] { _lio3_validate_target_chap_settings(&target); });
+    EXPECT_NE(log.find("(korvadm_mod_lio4:_lio3_validate_target_chap_settings:"), std::string::npos) << log;
+    EXPECT_NE(log.find("CHAP enabled, but CHAP password length = 17 is not between 12 to 16"), std::string::npos);
+}
+
+}  // namespace

@@ -1,0 +1,90 @@
+// Portal directory names: parsing, the kernel's list, and wanted portals
+// whose names would leave the np directory.
+#include <string>
+
+#include "common/korvadm_err.h"
+#include "kernel/korvadm_mod_lio4_internal.h"
+#include "tests/kernel/sample_tree.h"
+
+namespace {
+
+using Lio4Test = korv_test::SampleTree;
+
+TEST_F(Lio4Test, PortalNamesParse)
+{
+    char addr[40], iface[16];
+    struct {
+        const char *name;
+        int rc;
+        const char *addr = "", *iface = "";
+        int port = 0;
+    } cases[] = {
+        {"[fe80::1%eth0]:3260", 0, "fe80::1", "eth0", 3260},
+        {"10.0.0.1:3260", 0, "10.0.0.1", "", 3260},
+        {"[2001:db8::1]:65535", 0, "2001:db8::1", "", 65535},
+        {"10.0.0.1:", 0, "10.0.0.1", "", 0},
+        {"10.0.0.1:326000", ERR_PARAM},  // a six-character port
+        {"10.0.0.1", ERR_PARAM},
+        {"", ERR_ATTR_EMPTY},
+        {"[aaaaaaaaaaaaaaaaaaaaaaaaaaaaaaaaaaaaaaaa::1]:3260", ERR_PARAM},  // over-long address
+        {"[fe80::1%eeeeeeeeeeeeeeee]:3260", ERR_PARAM},                     // over-long interface
+    };
+    for (auto &c : cases) {
+        int port = -1;
+        ASSERT_EQ(_parse_lio_np_entry(addr, sizeof addr, &port, iface, sizeof iface, c.name), c.rc) << c.name;
+        if (c.rc == 0) {
+            EXPECT_STREQ(addr, c.addr);
+            EXPECT_STREQ(iface, c.iface);
+            EXPECT_EQ(port, c.port);
+        }
+    }
+    EXPECT_EQ(_check_np_ip_type("10.0.0.1:3260"), IP_TYPE_V4);
+    EXPECT_EQ(_check_np_ip_type("[::1]:3260"), IP_TYPE_V6);
+}
+
+TEST_F(Lio4Test, PortalListDropsNamesThatDoNotParse)
+{
+    load_tree("portals.tree");
+    list_t list;
+    list_init(&list);
+    ASSERT_EQ(lio3_get_target_existing_ip_list(&list, &target), 0);
+    EXPECT_EQ(list.count, 3);
+    iscsi_ip_t *ll = iscsi_ip_search_list_by_IPv6(&list, "fe80::1");
+    ASSERT_NE(ll, nullptr);
+    EXPECT_STREQ(ll->dev_name, "eth0");
+    EXPECT_EQ(ll->port, 3260);
+    iscsi_ip_free_list(&list);
+
+    target.tpgt = 2;  // no such portal group
+    EXPECT_EQ(lio3_get_target_existing_ip_list(&list, &target), ERR_CONFIGFS);
+    EXPECT_EQ(list.count, 0);
+}
+
+TEST_F(Lio4Test, WantedPortalsThatWouldLeaveTheirDirectoryAreRefusedWhole)
+{
+    load_tree("portals.tree");
+    const std::string kept = at(TPG) + "/np/[fe80::1%eth0]:3260";
+    const char *hostile[][2] = {
+        {"fe80::1", "eth0]:3260/../../../../../../../../../escaped"},  // up to the root
+        {"fe80::1", "eth0]:3260/../../../../iqn.x:other"},
+        {"fe80::1", ".."},
+        {"2001:db8::9/../../x", ""},
+    };
+    for (auto *set : {lio3_set_target_ip, lio3_set_target_ip_v2}) {
+        for (auto &h : hostile) {
+            iscsi_ip_free_list(&target.ip_list);
+            iscsi_ip_t *ip = iscsi_ip_new();
+            std::strcpy(ip->ipv6, h[0]);
+            std::strcpy(ip->dev_name, h[1]);
+            ip->port = 3261;
+            list_append(&ip->node, &target.ip_list);
+            EXPECT_EQ(set(&target), ERR_PARAM) << h[0] << " " << h[1];
+            EXPECT_TRUE(exists(kept)) << "a portal went before the list was refused";
+        }
+    }
+    EXPECT_FALSE(exists(at("/escaped]:3261")));
+    EXPECT_FALSE(exists(at("/sys/kernel/config/target/iscsi/iqn.x:other]:3261")));
+    EXPECT_EQ(_lio3_create_network_portal(IQN, 1, "a/b", "fe80::2", 3260, IP_TYPE_V6), ERR_PARAM);
+}
+
+}  // namespace
