@@ -77,14 +77,14 @@ int push_chap(const char *func, const iscsi_target_t *target, const char *initia
 {
     if (target->chap != 1)
         return KORV_OK;
-    std::string user = field(target->chap_user), pass = field(target->chap_pass);
+    std::string user = field_str(target->chap_user), pass = field_str(target->chap_pass);
     int rc = _lio3_set_target_acl_chap(target->iqn, target->tpgt, initiator, user.c_str(), pass.c_str());
     if (rc != 0) {
         DBG_AS(func, 0, "_lio3_set_target_acl_chap return error code: %d", rc);
         return ERR_CONFIGFS;
     }
     if (target->mutual_chap == 1) {
-        std::string muser = field(target->mutual_user), mpass = field(target->mutual_pass);
+        std::string muser = field_str(target->mutual_user), mpass = field_str(target->mutual_pass);
         rc = _lio3_set_target_acl_mutual_chap(target->iqn, target->tpgt, initiator, muser.c_str(),
                                               mpass.c_str());
         if (rc != 0) {
@@ -99,8 +99,7 @@ int push_chap(const char *func, const iscsi_target_t *target, const char *initia
 
 int _lio3_set_target_auth_ability(const char *iqn, int tpgt, int chap_flag)
 {
-    if (!tpgt_ok(tpgt))
-        return ERR_PARAM;
+    PARAM_GUARD(!tpgt_ok(tpgt));
     return write_switch_and_auth_method(__func__, iqn, tpgt, "/attrib/authentication", chap_flag == 1 ? 1 : 0);
 }
 int _lio3_set_target_chap_all_acl(const iscsi_target_t *target)
@@ -139,25 +138,16 @@ int _lio3_validate_target_chap_settings(const iscsi_target_t *target)
 
 int _lio3_set_target_chap_to_acl(const char *initiator_iqn, iscsi_target_t *target)
 {
-    if (!initiator_iqn || !*initiator_iqn || !is_component(initiator_iqn)) {
-        DBG(0, "initiator iqn is empty");
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(!initiator_iqn || !*initiator_iqn || !is_component(initiator_iqn), "initiator iqn is empty");
     CHECK_TARGET(target, "target is NULL", "target iqn is empty", "target tpgt is wrong: %d", target->tpgt);
-    if (!_lio3_validate_target_chap_settings(target)) {
-        DBG(0, "CHAP setting is not correct");
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(!_lio3_validate_target_chap_settings(target), "CHAP setting is not correct");
     return push_chap(__func__, target, initiator_iqn);
 }
 
 int lio3_set_target_chap(iscsi_target_t *target)
 {
     CHECK_TARGET(target, "target is NULL", "target IQN is empty", "target TPGT out of limitation");
-    if (!_lio3_validate_target_chap_settings(target)) {
-        DBG(0, "CHAP setting is not correct");
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(!_lio3_validate_target_chap_settings(target), "CHAP setting is not correct");
     if (_lio3_set_target_auth_ability(target->iqn, target->tpgt, target->chap) != 0) {
         DBG(0, "_lio3_set_target_attrib_authentication failed");
         return ERR_CONFIGFS;

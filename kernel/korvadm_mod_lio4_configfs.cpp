@@ -25,10 +25,6 @@ namespace {
 
 using korv::file_ptr;
 
-struct free_deleter {
-    void operator()(void *p) const { std::free(p); }
-};
-
 }  // namespace
 
 namespace lio4 {
@@ -139,8 +135,7 @@ int remove_all_subdirs(const char *func, const std::string &dir)
 
 int configfs_mkdir(const char *path)
 {
-    if (!path)
-        return ERR_PARAM;
+    PARAM_GUARD(!path);
     if (make_dir_include_parent(path, 0700) != 0)
         DBG(0, "mkdir %s failed", path);
     return KORV_OK;
@@ -148,8 +143,7 @@ int configfs_mkdir(const char *path)
 
 int configfs_rmdir(const char *path)
 {
-    if (!path)
-        return ERR_PARAM;
+    PARAM_GUARD(!path);
     if (remove_dir(path) != 0) {
         DBG(2, "remove %s failed", path);
         return ERR_SHELL;
@@ -159,8 +153,7 @@ int configfs_rmdir(const char *path)
 
 int configfs_rmdir_recursive(const char *path)
 {
-    if (!path)
-        return ERR_PARAM;
+    PARAM_GUARD(!path);
     return remove_dir_recurive(path) == 0 ? KORV_OK : ERR_SHELL;
 }
 
@@ -171,7 +164,7 @@ int configfs_path_exist(const char *path)
 
 int configfs_is_mounted(void)
 {
-    std::string mount_point = sysroot_path(CONFIGFS_MOUNT);
+    std::string mount_point = fixed_path(CONFIGFS_MOUNT);
     if (!sys_mount_point(mount_point.c_str()))
         return -1;
     return configfs_path_exist(mount_point.c_str());
@@ -180,15 +173,14 @@ int configfs_is_mounted(void)
 int configfs_mount(void)
 {
     std::string mount_point;
-    if (!korv::shell_escape(sysroot_path(CONFIGFS_MOUNT).c_str(), mount_point))
+    if (!korv::shell_escape(fixed_path(CONFIGFS_MOUNT).c_str(), mount_point))
         return ERR_NO_MEMORY;
     return System("mount -t configfs configfs \"%s\"", mount_point.c_str()) == 0 ? KORV_OK : ERR_SHELL;
 }
 
 int configfs_read_attr_str(const char *path, char *buf, size_t size)
 {
-    if (!path || !buf || size == 0)
-        return ERR_PARAM;
+    PARAM_GUARD(!path || !buf || size == 0);
     file_ptr f(std::fopen(path, "r"));
     if (!f) {
         DBG(0, "open attribute %s failed", path);
@@ -222,8 +214,7 @@ int configfs_read_attr_str(const char *path, char *buf, size_t size)
 
 int configfs_read_attr_buf(const char *path, char *buf, size_t size, size_t *out_len)
 {
-    if (!path || !buf || size == 0 || !out_len)
-        return ERR_PARAM;
+    PARAM_GUARD(!path || !buf || size == 0 || !out_len);
     file_ptr f(std::fopen(path, "r"));
     if (!f) {
         DBG(0, "open attribute %s failed", path);
@@ -235,8 +226,7 @@ int configfs_read_attr_buf(const char *path, char *buf, size_t size, size_t *out
 
 int configfs_read_attr_int(const char *path, int *out)
 {
-    if (!path || !out)
-        return ERR_PARAM;
+    PARAM_GUARD(!path || !out);
     char buf[128] = {0};
     int rc = configfs_read_attr_str(path, buf, sizeof buf);
     if (rc != 0)
@@ -252,8 +242,7 @@ int configfs_read_attr_int(const char *path, int *out)
 
 int configfs_write_attr_str(const char *path, const char *value, int verify)
 {
-    if (!path || !value)
-        return ERR_PARAM;
+    PARAM_GUARD(!path || !value);
     DBG(2, "write |%s| to |%s| ", value, path);
     std::string v, p;
     if (!korv::shell_escape(value, v) || !korv::shell_escape(path, p))
@@ -270,7 +259,7 @@ int configfs_write_attr_str(const char *path, const char *value, int verify)
     if (!verify)
         return KORV_OK;
     size_t read_size = std::strlen(value) + 1;
-    std::unique_ptr<char, free_deleter> read_val(static_cast<char *>(std::calloc(1, read_size)));
+    korv::c_buffer read_val(static_cast<char *>(std::calloc(1, read_size)));
     if (!read_val) {
         DBG(0, "unable to allocate read_val");
         return ERR_NO_MEMORY;

@@ -17,7 +17,10 @@
 #include <string_view>
 #include <vector>
 
+#include "common/korvadm_err.h"
+#include "common/korvadm_list.h"
 #include "common/korvadm_log.h"
+#include "common/korvadm_str.h"
 #include "common/korvadm_sysroot.h"
 #include "kernel/korvadm_mod_lio4.h"
 
@@ -39,20 +42,7 @@ struct target_deleter {
 };
 using target_ptr = std::unique_ptr<iscsi_target_t, target_deleter>;
 
-struct ip_list_guard {
-    list_t list;
-    ip_list_guard() { list_init(&list); }
-    ~ip_list_guard() { iscsi_ip_free_list(&list); }
-    ip_list_guard(const ip_list_guard &) = delete;
-    ip_list_guard &operator=(const ip_list_guard &) = delete;
-};
-
-// A fixed text field as a string, never reading past the field.
-template <size_t N>
-std::string field(const char (&text)[N])
-{
-    return std::string(text, strnlen(text, N));
-}
+using korv::field_str;
 
 // Names from records become one path component: no '/', not "." or "..".
 inline bool is_component(std::string_view name)
@@ -65,9 +55,17 @@ inline bool tpgt_ok(int tpgt)
     return tpgt >= 0 && tpgt <= ISCSI_TPGT_MAX;
 }
 
+/* Paths: every path the unit uses is built here, mapped through the system
+ * root once (the unit's only calls of sysroot_path). Names from records are
+ * checked to be one component before they get here. */
+inline std::string fixed_path(const char *path)  // one of the constants above, or a module file
+{
+    return sysroot_path(path);
+}
+
 inline std::string iqn_dir(std::string_view iqn)
 {
-    return sysroot_path(FABRIC_ROOT) + "/" + std::string(iqn);
+    return fixed_path(FABRIC_ROOT) + "/" + std::string(iqn);
 }
 
 inline std::string tpg_dir(std::string_view iqn, int tpgt)
@@ -77,7 +75,18 @@ inline std::string tpg_dir(std::string_view iqn, int tpgt)
 
 inline std::string fileio_dir(int hba_id, std::string_view lun_name)
 {
-    return sysroot_path(CORE_ROOT) + "/fileio_" + std::to_string(hba_id) + "/" + std::string(lun_name);
+    return fixed_path(CORE_ROOT) + "/fileio_" + std::to_string(hba_id) + "/" + std::string(lun_name);
+}
+
+// ALUA state of a portal group and of a backstore's unit serial.
+inline std::string alua_tpg_dir(std::string_view iqn, int tpgt)
+{
+    return fixed_path(VAR_ALUA_DIR) + "/iSCSI/" + std::string(iqn) + "+" + std::to_string(tpgt);
+}
+
+inline std::string alua_serial_dir(std::string_view serial)
+{
+    return fixed_path(VAR_ALUA_DIR) + "/tpgs_" + std::string(serial);
 }
 
 enum class tcheck { ok, null, iqn, bad_iqn, tpgt };

@@ -67,7 +67,7 @@ int _brute_force_remove_mod(void)
     DBG(1, "!!! FORCE TO REMOVE ISCSI MODULE !!!");
     for (const char *tree : {FABRIC_ROOT, CORE_ROOT}) {
         std::string path;
-        if (korv::shell_escape(sysroot_path(tree).c_str(), path))
+        if (korv::shell_escape(fixed_path(tree).c_str(), path))
             System("rm -rf \"%s\"", path.c_str());
     }
     // The core module goes before the file backstore module: kept in this order.
@@ -89,19 +89,19 @@ int lio3_start_module(void)
 
     // Success is judged by /proc/modules alone: insmod also fails when the
     // module is already there.
-    _insert_mod(sysroot_path(MODULES[0].file).c_str());
+    _insert_mod(fixed_path(MODULES[0].file).c_str());
     if (check_kmodule_inserted(MODULES[0].name) != 0)
         DBG(0, "Insert module target_core_mod.ko failed");
 
-    std::string fabric = sysroot_path(FABRIC_ROOT);
+    std::string fabric = fixed_path(FABRIC_ROOT);
     bool started = false;
     do {
-        _insert_mod(sysroot_path(MODULES[1].file).c_str());
+        _insert_mod(fixed_path(MODULES[1].file).c_str());
         if (check_kmodule_inserted(MODULES[1].name) != 0) {
             DBG(0, "Insert module target_core_file.ko failed");
             break;
         }
-        _insert_mod(sysroot_path(MODULES[2].file).c_str());
+        _insert_mod(fixed_path(MODULES[2].file).c_str());
         if (check_kmodule_inserted(MODULES[2].name) != 0) {
             DBG(0, "Insert module iscsi_target_mod failed");
             break;
@@ -123,7 +123,7 @@ int lio3_start_module(void)
         return ERR_MODULE_START;
     }
     for (const char *dir : {VAR_PR_DIR, VAR_ALUA_DIR}) {
-        std::string path = sysroot_path(dir);
+        std::string path = fixed_path(dir);
         if (make_dir_include_parent(path.c_str(), 0700) != 0)
             DBG(0, "make var dir %s failed", path.c_str());
     }
@@ -134,7 +134,7 @@ int lio3_get_module_state(void)
 {
     if (check_kmodule_inserted("iscsi_target_mod") != 0)
         return 1;
-    return configfs_path_exist(sysroot_path(FABRIC_ROOT).c_str()) == 0 ? 0 : ERR_MODULE_NO_CONFIGFS;
+    return configfs_path_exist(fixed_path(FABRIC_ROOT).c_str()) == 0 ? 0 : ERR_MODULE_NO_CONFIGFS;
 }
 
 int lio3_stop_module(void)
@@ -145,7 +145,7 @@ int lio3_stop_module(void)
     if (state == 0) {
         // Half started has nothing in configfs to clear.
         _lio3_remove_all_iscsi_target();
-        configfs_rmdir(sysroot_path(FABRIC_ROOT).c_str());
+        configfs_rmdir(fixed_path(FABRIC_ROOT).c_str());
         _lio3_shutdown_all_hba();
     }
     if (_remove_mod("iscsi_target_mod", 1) != 0 || _remove_mod("target_core_file", 1) != 0)

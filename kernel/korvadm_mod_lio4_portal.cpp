@@ -56,8 +56,7 @@ int _lio3_create_network_portal(const char *iqn, int tpgt, const char *interface
                                 int port, int type)
 {
     std::string path;
-    if (!np_path(iqn, tpgt, interface, address, port, type, path))
-        return ERR_PARAM;
+    PARAM_GUARD(!np_path(iqn, tpgt, interface, address, port, type, path));
     return make_dir(path.c_str(), 0700) == 0 ? KORV_OK : ERR_CONFIGFS;
 }
 
@@ -65,8 +64,7 @@ int _lio3_remove_network_portal(const char *iqn, int tpgt, const char *interface
                                 int port, int type)
 {
     std::string path;
-    if (!np_path(iqn, tpgt, interface, address, port, type, path))
-        return ERR_PARAM;
+    PARAM_GUARD(!np_path(iqn, tpgt, interface, address, port, type, path));
     return configfs_rmdir(path.c_str()) == 0 ? KORV_OK : ERR_CONFIGFS;
 }
 
@@ -127,7 +125,7 @@ int _get_exist_ip_list(const iscsi_target_t *target, list_t *list)
         DBG(0, "can not open directory : %s", np.c_str());
         return ERR_PARAM;
     }
-    ip_list_guard found;
+    korv::list_owner found(iscsi_ip_free_list);
     for (const std::string &name : names) {
         DBG(2, "get one existing np : %s", name.c_str());
         iscsi_ip_t *ip = iscsi_ip_new();
@@ -149,13 +147,9 @@ int _get_exist_ip_list(const iscsi_target_t *target, list_t *list)
             continue;
         }
         ip->port = port;
-        list_append(&ip->node, &found.list);
+        list_append(&ip->node, found.get());
     }
-    while (found.list.head) {
-        list_node_t *node = found.list.head;
-        list_remove(node);
-        list_append(node, list);
-    }
+    found.hand_over(list);
     return KORV_OK;
 }
 
@@ -180,7 +174,7 @@ int _lio3_remove_all_np(const iscsi_target_t *target)
 int lio3_set_target_ip(iscsi_target_t *target)
 {
     CHECK_TARGET(target, "target is NULL", "target IQN is empty", "target TPGT out of limitation");
-    if (!wanted_portals_ok(__func__, target))
+    if (!wanted_portals_ok(__func__, target))  // logged there
         return ERR_PARAM;
     if (_lio3_remove_all_np(target) != 0)
         DBG(0, "_lio3_remove_all_np error");
@@ -191,13 +185,13 @@ int lio3_set_target_ip(iscsi_target_t *target)
 int lio3_set_target_ip_v2(iscsi_target_t *target)
 {
     CHECK_TARGET(target, "target is NULL", "target IQN is empty", "target TPGT out of limitation");
-    if (!wanted_portals_ok(__func__, target))
+    if (!wanted_portals_ok(__func__, target))  // logged there
         return ERR_PARAM;
-    ip_list_guard existing;
-    if (_get_exist_ip_list(target, &existing.list) != 0)
+    korv::list_owner existing(iscsi_ip_free_list);
+    if (_get_exist_ip_list(target, existing.get()) != 0)
         DBG(0, "_get_exist_ip_list error");
-    create_portals(__func__, target, &existing.list);
-    for (iscsi_ip_t *ip : korv::list_records<iscsi_ip_t>(&existing.list)) {
+    create_portals(__func__, target, existing.get());
+    for (iscsi_ip_t *ip : korv::list_records<iscsi_ip_t>(existing.get())) {
         for (int type : {IP_TYPE_V4, IP_TYPE_V6}) {
             const char *address = ip_address(ip, type);
             if (!address[0] || list_has_address(&target->ip_list, ip, type))
@@ -212,10 +206,7 @@ int lio3_set_target_ip_v2(iscsi_target_t *target)
 
 int lio3_get_target_existing_ip_list(list_t *ip_list, iscsi_target_t *target)
 {
-    if (!ip_list || !target) {
-        DBG(0, "ip_list or target is NULL");
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(!ip_list || !target, "ip_list or target is NULL");
     CHECK_TARGET(target, "target is NULL", "target IQN is empty", "target TPGT out of limitation");
     if (_get_exist_ip_list(target, ip_list) != 0) {
         DBG(0, "_get_exist_ip_list error");
@@ -236,10 +227,7 @@ int _check_np_ip_type(const char *name)
 
 int _parse_lio_np_entry(char *addr, size_t addr_size, int *port, char *iface, size_t if_size, const char *name)
 {
-    if (!addr || !port || !iface || !name || addr_size == 0 || if_size == 0) {
-        DBG(0, "parameter error");
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(!addr || !port || !iface || !name || addr_size == 0 || if_size == 0, "parameter error");
     if (!*name) {
         DBG(0, "np_ent_name is empty");
         return ERR_ATTR_EMPTY;
@@ -248,27 +236,18 @@ int _parse_lio_np_entry(char *addr, size_t addr_size, int *port, char *iface, si
     if (rest.front() == '[')
         rest.remove_prefix(1);
     size_t colon = rest.rfind(':');
-    if (colon == std::string_view::npos) {
-        DBG(0, "can not find port number in %s", name);
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(colon == std::string_view::npos, "can not find port number in %s", name);
     std::string_view address = rest.substr(0, colon);
     if (!address.empty() && address.back() == ']')
         address.remove_suffix(1);
     std::string_view port_text = rest.substr(colon + 1);
-    if (port_text.size() >= 6) {
-        DBG(0, "can not find port number in %s", name);
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(port_text.size() >= 6, "can not find port number in %s", name);
     std::string_view scope;
     if (size_t pct = address.rfind('%'); pct != std::string_view::npos) {
         scope = address.substr(pct + 1);
         address = address.substr(0, pct);
     }
-    if (address.size() >= addr_size || scope.size() >= if_size) {
-        DBG(0, "address or interface of %s too long", name);
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(address.size() >= addr_size || scope.size() >= if_size, "address or interface of %s too long", name);
     address.copy(addr, address.size());
     addr[address.size()] = '\0';
     scope.copy(iface, scope.size());

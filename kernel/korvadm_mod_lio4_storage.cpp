@@ -8,6 +8,7 @@
 #include <climits>
 #include <cstdlib>
 #include <cstring>
+#include <memory>
 #include <string>
 #include <vector>
 
@@ -57,50 +58,40 @@ int _lio3_shutdown_all_fileio_hba_backstore(const std::string &hba_dir, int hba_
     std::vector<std::string> names;
     if (!list_subdirs(hba_dir, names))
         return ERR_CONFIGFS;
-    iscsi_lun_t *lun = iscsi_lun_new();
+    std::unique_ptr<iscsi_lun_t, void (*)(iscsi_lun_t *)> lun(iscsi_lun_new(), iscsi_lun_free);
     if (!lun)
         return ERR_NO_MEMORY;
-    int rc = KORV_OK;
     for (const std::string &name : names) {
         if (name == "hba_info")
             continue;
-        if (name.size() >= sizeof lun->name) {
-            DBG(0, "can not remove backstore entry : %s", name.c_str());
-            rc = ERR_CONFIGFS;
-            break;
-        }
-        std::strcpy(lun->name, name.c_str());
         lun->hba_id = hba_id;
-        if (lio3_shutdown_backstore(lun) != 0) {
+        if (!korv::copy_bounded(lun->name, name.c_str()) || lio3_shutdown_backstore(lun.get()) != 0) {
             DBG(0, "can not remove backstore entry : %s", name.c_str());
-            rc = ERR_CONFIGFS;
-            break;
+            return ERR_CONFIGFS;
         }
     }
-    iscsi_lun_free(lun);
-    return rc;
+    return KORV_OK;
 }
 
 }  // namespace
 
 int _lio3_remove_fileio_device(iscsi_lun_t *lun)
 {
-    if (!lun)
-        return ERR_PARAM;
-    std::string name = field(lun->name);
+    PARAM_GUARD(!lun);
+    std::string name = field_str(lun->name);
     std::string backstore = fileio_dir(lun->hba_id, name);
     if (configfs_path_exist(backstore.c_str()) != 0) {
         DBG(0, "the lun fileio device : %s is already removed", backstore.c_str());
         return KORV_OK;
     }
-    std::string serial = field(lun->serial);
+    std::string serial = field_str(lun->serial);
     if (serial.empty()) {
         char vpd[512] = {0};
         std::string path = backstore + "/wwn/vpd_unit_serial";
         if (configfs_read_attr_str(path.c_str(), vpd, sizeof vpd) != 0)
             DBG(0, "get VPD serial failed");
     } else if (is_component(serial)) {
-        std::string alua = sysroot_path(VAR_ALUA_DIR) + "/tpgs_" + serial;
+        std::string alua = alua_serial_dir(serial);
         if (remove_dir_recurive(alua.c_str()) != 0)
             DBG(0, "remove var dir %s failed", alua.c_str());
     }
@@ -115,18 +106,9 @@ int _lio3_remove_fileio_device(iscsi_lun_t *lun)
 
 int lio3_shutdown_backstore(iscsi_lun_t *lun)
 {
-    if (!lun) {
-        DBG(0, "lun is NULL");
-        return ERR_PARAM;
-    }
-    if (lun->name[0] == '\0' || !is_component(field(lun->name))) {
-        DBG(0, "lun name is empty");
-        return ERR_PARAM;
-    }
-    if (lun->hba_id < 0) {
-        DBG(0, "lun hba id setting error");
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(!lun, "lun is NULL");
+    PARAM_GUARD(lun->name[0] == '\0' || !is_component(field_str(lun->name)), "lun name is empty");
+    PARAM_GUARD(lun->hba_id < 0, "lun hba id setting error");
     if (_lio3_remove_fileio_device(lun) != 0) {
         DBG(0, "remove fileio device error");
         return ERR_PARAM;
@@ -136,7 +118,7 @@ int lio3_shutdown_backstore(iscsi_lun_t *lun)
 
 int _lio3_shutdown_all_hba(void)
 {
-    std::string core = sysroot_path(CORE_ROOT);
+    std::string core = fixed_path(CORE_ROOT);
     if (configfs_path_exist(core.c_str()) != 0)
         return KORV_OK;
     std::vector<std::string> names;

@@ -29,8 +29,7 @@ namespace lio4 {
 int write_tpg_attr(const char *func, const char *iqn, int tpgt, const char *rel, const std::string &value,
                    const char *shown)
 {
-    if (!iqn || tpgt < 0)
-        return ERR_PARAM;
+    PARAM_GUARD(!iqn || tpgt < 0);
     std::string path = tpg_dir(iqn, tpgt) + rel;
     if (configfs_write_attr_str(path.c_str(), value.c_str(), 1) != 0) {
         DBG_AS(func, 0, "set %s = %s failed", path.c_str(), shown);
@@ -61,8 +60,7 @@ namespace {
 
 int _lio3_set_enable_default_policy(const char *iqn, int tpgt, int enable)
 {
-    if (!tpgt_ok(tpgt))
-        return ERR_PARAM;
+    PARAM_GUARD(!tpgt_ok(tpgt));
     return write_tpg_attr(__func__, iqn, tpgt, "/attrib/generate_node_acls", enable ? "1" : "0",
                           enable ? "Enable" : "Disable");
 }
@@ -88,7 +86,7 @@ int _lio3_set_target_default_cmdsn_depth(const char *iqn, int tpgt, int depth)
 // not leave the others at the kernel's defaults.
 int _set_target_default_attributes(const iscsi_target_t *target)
 {
-    std::string alias = field(target->alias);
+    std::string alias = field_str(target->alias);
     int rc = KORV_OK;
     if (_lio3_set_enable_default_policy(target->iqn, target->tpgt, 1) != 0) {
         DBG(0, "Enable default policy failed");
@@ -111,8 +109,7 @@ int _set_target_default_attributes(const iscsi_target_t *target)
 
 int _lio3_set_target_acl_dataout_timeout(int timeout, const char *iqn, int tpgt, const char *initiator)
 {
-    if (timeout < 0 || !iqn || !initiator || !tpgt_ok(tpgt))
-        return ERR_PARAM;
+    PARAM_GUARD(timeout < 0 || !iqn || !initiator || !tpgt_ok(tpgt));
     std::string path = tpg_dir(iqn, tpgt) + "/acls/" + initiator + "/attrib/dataout_timeout";
     if (configfs_write_attr_int(path.c_str(), timeout, 0) != 0) {
         DBG(0, "set %s = %d failed", path.c_str(), timeout);
@@ -138,10 +135,7 @@ int _lio3_read_target_enable(const iscsi_target_t *target)
 
 int _lio3_set_target_enable(const iscsi_target_t *target, int flag)
 {
-    if (flag != 0 && flag != 1) {
-        DBG(0, "parameter error");
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(flag != 0 && flag != 1, "parameter error");
     if (_lio3_read_target_enable(target) == flag)
         return KORV_OK;
     return write_switch_and_auth_method(__func__, target->iqn, target->tpgt, "/enable", flag);
@@ -158,7 +152,7 @@ int lio3_add_target(iscsi_target_t *target)
         return KORV_OK;
     }
     std::string iqn = iqn_dir(target->iqn);
-    std::string alua = sysroot_path(VAR_ALUA_DIR) + "/iSCSI/" + target->iqn + "+" + std::to_string(target->tpgt);
+    std::string alua = alua_tpg_dir(target->iqn, target->tpgt);
     bool iqn_existed = configfs_path_exist(iqn.c_str()) == 0;
     bool alua_existed = check_path_exist(alua.c_str()) == 0;
     int rc = configfs_mkdir(tpg.c_str());
@@ -254,10 +248,7 @@ int lio3_enable_target(iscsi_target_t *target)
 
 int lio3_disable_target(iscsi_target_t *target)
 {
-    if (target && !tpgt_ok(target->tpgt)) {
-        DBG(0, "target tpgt is wrong: %d", target->tpgt);
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(target && !tpgt_ok(target->tpgt), "target tpgt is wrong: %d", target->tpgt);
     CHECK_TARGET(target, "target is NULL", "target's IQN is empty", "target tpgt is wrong: %d", target->tpgt);
     if (_lio3_read_target_enable(target) == 0)
         return KORV_OK;
@@ -270,17 +261,11 @@ int lio3_disable_target(iscsi_target_t *target)
 
 int lio3_set_target_attr_dataout_timeout(int timeout, iscsi_target_t *target)
 {
-    if (!target) {
-        DBG(0, "target is NULL");
-        return ERR_PARAM;
-    }
-    if (timeout < 0) {
-        DBG(0, "da_out_timeout has an invalid value");
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(!target, "target is NULL");
+    PARAM_GUARD(timeout < 0, "da_out_timeout has an invalid value");
     CHECK_TARGET(target, "target is NULL", "target IQN is empty", "target TPGT out of limitation");
     if (configfs_path_exist(iqn_dir(target->iqn).c_str()) != 0) {
-        DBG(2, "target %s not in module", field(target->alias).c_str());
+        DBG(2, "target %s not in module", field_str(target->alias).c_str());
         return ERR_TARGET_NOT_IN_KERNEL;
     }
     std::string acls = tpg_dir(target->iqn, target->tpgt) + "/acls";
@@ -302,28 +287,25 @@ namespace {
 // The teardown's check: any tag the kernel shows.
 bool teardown_ok(const iscsi_target_t *t)
 {
-    return t && is_component(field(t->iqn)) && t->tpgt >= 0;
+    return t && is_component(field_str(t->iqn)) && t->tpgt >= 0;
 }
 }  // namespace
 
 int _lio3_remove_all_acl(iscsi_target_t *target)
 {
-    if (!teardown_ok(target))
-        return ERR_PARAM;
+    PARAM_GUARD(!teardown_ok(target));
     return remove_all_subdirs(__func__, tpg_dir(target->iqn, target->tpgt) + "/acls");
 }
 
 int _lio3_remove_all_lun(iscsi_target_t *target)
 {
-    if (!teardown_ok(target))
-        return ERR_PARAM;
+    PARAM_GUARD(!teardown_ok(target));
     return remove_all_subdirs(__func__, tpg_dir(target->iqn, target->tpgt) + "/lun");
 }
 
 int _lio3_remove_all_tpgt(iscsi_target_t *target)
 {
-    if (!target || !is_component(field(target->iqn)))
-        return ERR_PARAM;
+    PARAM_GUARD(!target || !is_component(field_str(target->iqn)));
     std::string dir = iqn_dir(target->iqn);
     std::vector<std::string> names;
     if (!list_subdirs(dir, names)) {
@@ -351,7 +333,7 @@ int _lio3_remove_all_tpgt(iscsi_target_t *target)
 
 int _lio3_remove_all_iscsi_target(void)
 {
-    std::string fabric = sysroot_path(FABRIC_ROOT);
+    std::string fabric = fixed_path(FABRIC_ROOT);
     if (configfs_path_exist(fabric.c_str()) != 0) {
         DBG(0, "target dir %s do not exist", fabric.c_str());
         return KORV_OK;
@@ -370,13 +352,8 @@ int _lio3_remove_all_iscsi_target(void)
         if (name == "discovery_auth" || name == "lio_version" || name == "sessions")
             continue;
         DBG(1, "removing %s", name.c_str());
-        iscsi_target_t *t = scratch.get();
-        bool fits = name.size() < sizeof t->iqn;
-        std::memset(t->iqn, 0, sizeof t->iqn);
-        t->tpgt = -1;
-        if (fits)
-            std::memcpy(t->iqn, name.data(), name.size());
-        if (!fits || _lio3_remove_all_tpgt(t) != 0) {
+        scratch->tpgt = -1;
+        if (!korv::copy_bounded(scratch->iqn, name.c_str()) || _lio3_remove_all_tpgt(scratch.get()) != 0) {
             DBG(0, "can not remove target entry : %s", name.c_str());
             return ERR_CONFIGFS;
         }
