@@ -39,8 +39,8 @@ int _lio3_add_lun_to_target(iscsi_lun_t *lun, iscsi_target_t *target)
         DBG(0, "create lun node: %s failed", dir.c_str());
         return ERR_CONFIGFS;
     }
-    std::string backstore = fileio_dir(lun->hba_id, field(lun->name));
-    std::string link = dir + "/" + field(lun->name);
+    std::string backstore = fileio_dir(lun->hba_id, field_str(lun->name));
+    std::string link = dir + "/" + field_str(lun->name);
     if (create_symlink(backstore.c_str(), link.c_str()) != 0) {
         DBG(0, "link %s to %s failed", link.c_str(), backstore.c_str());
         configfs_rmdir(dir.c_str());
@@ -55,7 +55,7 @@ int lio3_add_lun_mapping(iscsi_lun_t *lun, iscsi_target_t *target, int lun_numbe
 {
     if (check_lun(__func__, lun, PATH) != 0)
         return ERR_PARAM;
-    std::string name = field(lun->name);
+    std::string name = field_str(lun->name);
     if (configfs_path_exist(fileio_dir(lun->hba_id, name).c_str()) != 0) {
         DBG(0, "the lun : %s dos not exist", name.c_str());
         return ERR_PARAM;
@@ -80,7 +80,7 @@ int lio3_add_lun_mapping(iscsi_lun_t *lun, iscsi_target_t *target, int lun_numbe
         return ERR_BACKING_FILE_MISSING;
     }
     if (configfs_path_exist(target_lun_dir(target, lun_number).c_str()) == 0) {
-        DBG(0, "the lun %d of target %s has already exist", lun_number, field(target->alias).c_str());
+        DBG(0, "the lun %d of target %s has already exist", lun_number, field_str(target->alias).c_str());
         return ERR_LUN_ALREADY_MAPPED;
     }
     if (_lio3_add_lun_to_target(lun, target) != 0) {
@@ -127,8 +127,7 @@ int _lio3_del_lun_from_target(iscsi_lun_t *lun, iscsi_target_t *target)
         DBG(0, "remove lun fail");
         return ERR_CONFIGFS;
     }
-    std::string state = sysroot_path(VAR_ALUA_DIR) + "/iSCSI/" + target->iqn + "+" + std::to_string(target->tpgt) +
-                        "/lun_" + std::to_string(lun->lun_num);
+    std::string state = alua_tpg_dir(target->iqn, target->tpgt) + "/lun_" + std::to_string(lun->lun_num);
     if (configfs_path_exist(state.c_str()) == 0 && remove_dir_recurive(state.c_str()) != 0)
         DBG(0, "remove var alua lun path : |%s| fail", state.c_str());
     return KORV_OK;
@@ -139,7 +138,7 @@ int _lio3_remove_lun(iscsi_lun_t *lun, iscsi_target_t *target)
     if (check_lun(__func__, lun, NAME_HBA) != 0 || check_target(target) != tcheck::ok || !lun_num_ok(lun->lun_num))
         return ERR_PARAM;
     std::string dir = target_lun_dir(target, lun->lun_num);
-    std::string link = dir + "/" + field(lun->name);
+    std::string link = dir + "/" + field_str(lun->name);
     if (remove_file(link.c_str()) != 0) {
         DBG(0, "remove link to back store : |%s| failed", link.c_str());
         return ERR_CONFIGFS;
@@ -157,7 +156,7 @@ int lio3_del_lun_mapping(iscsi_lun_t *lun, iscsi_target_t *target)
         return ERR_PARAM;
     // With its backstore gone nothing can map this LUN any more; a wrong HBA
     // id lands here too, so it is not taken as done.
-    if (configfs_path_exist(fileio_dir(lun->hba_id, field(lun->name)).c_str()) != 0) {
+    if (configfs_path_exist(fileio_dir(lun->hba_id, field_str(lun->name)).c_str()) != 0) {
         DBG(0, "the lun : %s has been removed", lun->name);
         return ERR_BACKSTORE_MISSING;
     }

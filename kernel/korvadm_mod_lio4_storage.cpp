@@ -31,7 +31,7 @@ bool terminated(const char (&text)[N])
 
 std::string hba_dir(int hba_id)
 {
-    return sysroot_path(CORE_ROOT) + "/fileio_" + std::to_string(hba_id);
+    return fixed_path(CORE_ROOT) + "/fileio_" + std::to_string(hba_id);
 }
 
 int _lio3_remove_all_fileio_bkstor_tg_pt_gp(const std::string &backstore)
@@ -213,7 +213,7 @@ int _lio3_remove_fileio_device_brute_force(iscsi_lun_t *lun)
 {
     if (!lun)
         return ERR_PARAM;
-    std::string backstore = fileio_dir(lun->hba_id, field(lun->name));
+    std::string backstore = fileio_dir(lun->hba_id, field_str(lun->name));
     if (remove_tree(backstore) != 0) {
         DBG(0, "create lun node: %s failed", backstore.c_str());
         return ERR_CONFIGFS;
@@ -225,14 +225,14 @@ int _lio3_create_fileio_device(iscsi_lun_t *lun)
 {
     if (check_lun(__func__, lun, PATH | SIZE) != 0)
         return ERR_PARAM;
-    std::string backstore = fileio_dir(lun->hba_id, field(lun->name));
+    std::string backstore = fileio_dir(lun->hba_id, field_str(lun->name));
     configfs_mkdir(backstore.c_str());
     if (configfs_path_exist(backstore.c_str()) != 0) {
         DBG(0, "create lun node: %s failed", backstore.c_str());
         return ERR_CONFIGFS;
     }
     std::string control = backstore + "/control";
-    std::string params = "fd_dev_name=" + field(lun->path) + ",fd_dev_size=" + std::to_string(lun->size) +
+    std::string params = "fd_dev_name=" + field_str(lun->path) + ",fd_dev_size=" + std::to_string(lun->size) +
                          ",fd_buffered_io=1";
     if (configfs_write_attr_str(control.c_str(), params.c_str(), 0) != 0) {
         DBG(0, "set device parameter: %s to %s failed", control.c_str(), params.c_str());
@@ -240,7 +240,7 @@ int _lio3_create_fileio_device(iscsi_lun_t *lun)
         return ERR_CONFIGFS;
     }
     std::string vpd = backstore + "/wwn/vpd_unit_serial";
-    std::string serial = field(lun->serial);
+    std::string serial = field_str(lun->serial);
     if (!serial.empty()) {
         if (configfs_write_attr_str(vpd.c_str(), serial.c_str(), 0) != 0) {
             DBG(0, "set device parameter: %s to %s failed", vpd.c_str(), serial.c_str());
@@ -255,10 +255,9 @@ int _lio3_create_fileio_device(iscsi_lun_t *lun)
     }
     // The kernel's own text is used whole; one that cannot name a directory
     // gets none.
-    std::string alua = "tpgs_" + serial;
-    if (serial.empty() || !is_component(alua) ||
-        make_dir_include_parent((sysroot_path(VAR_ALUA_DIR) + "/" + alua).c_str(), 0700) != 0)
-        DBG(0, "make var dir %s failed", (sysroot_path(VAR_ALUA_DIR) + "/" + alua).c_str());
+    std::string alua = alua_serial_dir(serial);
+    if (serial.empty() || !is_component("tpgs_" + serial) || make_dir_include_parent(alua.c_str(), 0700) != 0)
+        DBG(0, "make var dir %s failed", alua.c_str());
     return KORV_OK;
 }
 
@@ -266,7 +265,7 @@ int lio3_add_backstore(iscsi_lun_t *lun)
 {
     if (check_lun(__func__, lun, PATH | SIZE) != 0)
         return ERR_PARAM;
-    std::string name = field(lun->name), path = field(lun->path);
+    std::string name = field_str(lun->name), path = field_str(lun->path);
     std::string backstore = fileio_dir(lun->hba_id, name);
     if (configfs_path_exist(backstore.c_str()) == 0) {
         DBG(0, "the lun : %s is already alive", name.c_str());
@@ -308,7 +307,7 @@ int lio3_del_backstore(iscsi_lun_t *lun)
     // The real path decides: a path that only mentions the directory
     // (".../fileio/../../etc/x", or a link out of it) is not ours to delete.
     char real[PATH_MAX];
-    std::string path = field(lun->path);
+    std::string path = field_str(lun->path);
     if (path.empty() || !realpath(path.c_str(), real) || !std::strstr(real, OWN_FILES))
         return KORV_OK;
     if (remove_file(real) != 0)
@@ -321,7 +320,7 @@ int lio3_change_backstore_size(iscsi_lun_t *lun)
     // A size of 0 would leave the kernel computing a capacity below zero.
     if (check_lun(__func__, lun, SIZE) != 0)
         return ERR_PARAM;
-    std::string backstore = fileio_dir(lun->hba_id, field(lun->name));
+    std::string backstore = fileio_dir(lun->hba_id, field_str(lun->name));
     if (configfs_path_exist(backstore.c_str()) != 0) {
         DBG(0, "the lun : %s is not alive", lun->name);
         return ERR_BACKSTORE_MISSING;
