@@ -36,7 +36,7 @@ protected:
     // parents made as needed; '#' comments.
     static void load_tree(const std::string &name)
     {
-        std::ifstream in(std::string(KORV_KERNEL_DATA) + "/" + name);
+        std::ifstream in(std::string(KORV_TEST_DATA) + "/" + name);
         ASSERT_TRUE(in) << name;
         std::string line;
         while (std::getline(in, line)) {
