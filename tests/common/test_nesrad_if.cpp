@@ -1,0 +1,186 @@
+// The daemon control interface: starting, restarting, stopping and
+// signalling nesrad through the shell and the stored settings, with a
+// stand-in daemon as the witness of what the shell passed, and the real
+// daemon against isnsd for the signal path. Everything here stops daemons by
+// name, so it runs only as process 1 of its own PID namespace.
+#include "common/korvadm_nesrad_if.h"
+#include "common/korvadm_err.h"
+#include "config/korvadm_xmldb_conf.h"
+#include "tests/daemon/daemon_harness.h"
+#include "tests/support/isns_isnsd.h"
+#include "tests/support/xmldbd_fixture.h"
+
+#include <gtest/gtest.h>
+
+#include <chrono>
+#include <csignal>
+#include <cstdlib>
+#include <dirent.h>
+#include <fstream>
+#include <string>
+#include <sys/wait.h>
+#include <unistd.h>
+#include <vector>
+
+namespace {
+
+using namespace korv_test;
+using namespace std::chrono_literals;
+
+// Daemons the shell started are orphans reparented to us (process 1): reap
+// the ones that ended, then list the live processes named nesrad.
+std::vector<pid_t> running_daemons()
+{
+    while (waitpid(-1, nullptr, WNOHANG) > 0) {
+    }
+    std::vector<pid_t> pids;
+    DIR *proc = opendir("/proc");
+    for (dirent *e; proc && (e = readdir(proc));) {
+        std::ifstream comm(std::string("/proc/") + e->d_name + "/comm");
+        std::string name;
+        if (std::getline(comm, name) && name == "nesrad")
+            pids.push_back(std::atoi(e->d_name));
+    }
+    if (proc)
+        closedir(proc);
+    return pids;
+}
+
+bool settled(size_t count)
+{
+    return eventually([&] { return running_daemons().size() == count; }, 10s);
+}
+
+std::string stored_ip()
+{
+    char ip[256] = {};
+    xmldb_get_nesrad_ip(ip, sizeof(ip));
+    return ip;
+}
+
+int stored_enable()
+{
+    int enable = -1;
+    xmldb_get_nesrad_enable(&enable);
+    return enable;
+}
+
+class NesradControl : public SysRootTest {
+protected:
+    void SetUp() override
+    {
+        if (getpid() != 1)
+            GTEST_SKIP() << "stops processes by name: needs its own PID namespace (run as root with unshare)";
+        SysRootTest::SetUp();
+        db_ = std::make_unique<XmldbService>();
+        path_ = std::getenv("PATH");
+    }
+    void TearDown() override
+    {
+        if (getpid() == 1) {
+            isns_set_ctl_module(0, nullptr);
+            settled(0);
+            setenv("PATH", path_.c_str(), 1);
+        }
+    }
+    // "nesrad" on PATH is the stand-in (or the real daemon's directory).
+    void use_daemon_dir(const std::string &dir) { setenv("PATH", (dir + ":" + path_).c_str(), 1); }
+    std::vector<std::string> standin_args() const
+    {
+        std::ifstream in(SysRoot::file("/standin.args"));
+        std::vector<std::string> lines;
+        for (std::string l; std::getline(in, l);)
+            lines.push_back(l);
+        return lines;
+    }
+
+    std::unique_ptr<XmldbService> db_;
+    std::string path_;
+};
+
+TEST_F(NesradControl, SettingStartsRestartsAndStopsOnlyWhenTheServiceRuns)
+{
+    use_daemon_dir(STANDIN_DIR);
+    const std::string hostile = "isns\"$(touch x)`id`\\.example";
+
+    // Service disabled: only stored, nothing started.
+    xmldb_set_service_enable(0);
+    EXPECT_EQ(0, isns_set_setting(1, "first.example", 0));
+    EXPECT_EQ(1, stored_enable());
+    EXPECT_EQ("first.example", stored_ip());
+    EXPECT_TRUE(running_daemons().empty());
+    EXPECT_EQ(ERR_PARAM, isns_set_setting(2, "first.example", 0));
+
+    // Service enabled, flag already 1 with another server: a start with the
+    // escaped server, which reaches the daemon byte for byte.
+    xmldb_set_service_enable(1);
+    EXPECT_EQ(0, isns_set_setting(1, hostile.c_str(), 0));
+    ASSERT_TRUE(settled(1));
+    const pid_t first = running_daemons().front();
+    ASSERT_TRUE(eventually([&] { return standin_args().size() == 1; }, 5s));
+    EXPECT_EQ(hostile, standin_args()[0]);
+    EXPECT_FALSE(exists(at("/x"))) << "a command in the server text ran";
+    EXPECT_EQ(hostile, stored_ip());
+
+    // Same server (stored one used): the running daemon is left alone.
+    EXPECT_EQ(0, isns_set_setting(1, "ignored", 1));
+    EXPECT_EQ(std::vector<pid_t>{first}, running_daemons());
+    EXPECT_EQ(hostile, stored_ip());
+
+    // Another server: stopped by name, then a new daemon.
+    EXPECT_EQ(0, isns_set_setting(1, "second.example", 0));
+    ASSERT_TRUE(eventually([&] { auto d = running_daemons(); return d.size() == 1 && d[0] != first; }, 10s));
+    EXPECT_EQ(2u, standin_args().size());
+
+    // An empty server is refused before anything is stopped.
+    EXPECT_EQ(ERR_PARAM, isns_set_ctl_module(1, ""));
+    EXPECT_EQ(1u, running_daemons().size());
+
+    // Off with the service disabled: stored only; with it enabled: stopped.
+    xmldb_set_service_enable(0);
+    EXPECT_EQ(0, isns_set_setting(0, nullptr, 0));
+    EXPECT_EQ(0, stored_enable());
+    EXPECT_EQ(1u, running_daemons().size());
+    xmldb_set_service_enable(1);
+    EXPECT_EQ(0, isns_set_setting(0, nullptr, 0));
+    EXPECT_TRUE(settled(0));
+    EXPECT_EQ("second.example", stored_ip());
+}
+
+TEST_F(NesradControl, NotifyReachesTheRealDaemonAndResetClearsTheSettings)
+{
+    if (!isnsd_available())
+        GTEST_SKIP() << "isnsd not installed";
+    isnsd_server srv("127.60.0.1");
+    ASSERT_TRUE(srv.start()) << srv.error();
+    set_host_name("nas1");
+    store_targets("nas1", {{"disk1"}});
+    auto nodes = [&] { return isnsadm_rows(srv, "nodes", {"iSCSI name"}); };
+
+    // No daemon: nothing is signalled and the tool does not wait.
+    auto t0 = std::chrono::steady_clock::now();
+    notify_isnsclient(SIGUSR1);
+    EXPECT_LT(std::chrono::steady_clock::now() - t0, 999ms);
+
+    use_daemon_dir(NESRAD_DIR);
+    xmldb_set_service_enable(1);
+    ASSERT_EQ(0, isns_set_setting(1, "127.60.0.1", 0));
+    ASSERT_TRUE(eventually([&] { return nodes().count(target_iqn("nas1", "disk1")) == 1; }, 20s));
+    ASSERT_TRUE(settled(1));
+    EXPECT_EQ(running_daemons().front(), stored_pid());
+
+    store_targets("nas1", {{"disk1"}, {"disk2"}});
+    notify_isnsclient(SIGUSR1);
+    EXPECT_TRUE(eventually([&] { return nodes().count(target_iqn("nas1", "disk2")) == 1; }, 20s));
+
+    ASSERT_EQ(0, isns_set_setting(0, nullptr, 1));
+    EXPECT_TRUE(settled(0));
+    EXPECT_EQ(0, stored_pid());
+    EXPECT_TRUE(eventually([&] { return nodes().empty(); }, 10s));
+
+    EXPECT_EQ(0, isns_factory_reset());
+    EXPECT_EQ(0, stored_enable());
+    EXPECT_EQ("", stored_ip());
+}
+
+}  // namespace
