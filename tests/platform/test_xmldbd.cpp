@@ -27,18 +27,13 @@
 #include <vector>
 
 using korv_test::SysRoot;
+using korv_test::xmldb_get;
 using korv_test::XmldbProcess;
 using korv_test::XmldbService;
 
 namespace {
 
 const char *const S = XMLDB_SOCK_ISCSI;
-
-std::string get(const std::string &path)
-{
-    char buf[256];
-    return xmldbc_get_wb(S, 0, path.c_str(), buf, sizeof buf) < 0 ? "<failed>" : buf;
-}
 
 // A client that speaks bytes, not the protocol.
 struct RawClient {
@@ -138,7 +133,7 @@ TEST(XmldbBadInput, GarbageAndOversizedFramesAreRefusedAndNeverTakeTheServiceDow
             ASSERT_TRUE(a[0] == xmldb::kOk || a[0] == xmldb::kFail);
         }
     }
-    EXPECT_EQ(get("/k"), "v");
+    EXPECT_EQ(xmldb_get("/k"), "v");
 
     // Lengths that cannot be skipped: refused once, then the connection closes.
     for (uint32_t len : {0u, 0xffffffffu, static_cast<uint32_t>(xmldb::kRequestMax + 1)}) {
@@ -171,7 +166,7 @@ TEST(XmldbBadInput, StuckAndGreedyClientsStayWithinTheAnswerBudgetAndOthersAreSe
     EXPECT_EQ(probe.ask(xmldb::Op::Ping, "/"), std::string(1, xmldb::kOk) + "xmldbd");
     for (int i = 0; i < 50; ++i) {  // and then no more held up by them
         ASSERT_EQ(xmldbc_set(S, 0, ("/other/" + std::to_string(i)).c_str(), "ok"), 0);
-        ASSERT_EQ(get("/other/" + std::to_string(i)), "ok");
+        ASSERT_EQ(xmldb_get("/other/" + std::to_string(i)), "ok");
     }
     EXPECT_LT(proc_figure(db.config().pid(), "VmHWM"), tree_rss + (72u << 20));
 
@@ -224,7 +219,7 @@ TEST(XmldbConcurrency, ParallelWritersLoseNothing)
         int bad = 0;
         for (int k = 0; k < 150; ++k)
             bad += xmldbc_set(S, 0, key(p, k).c_str(), std::to_string(p * 1000 + k).c_str()) != 0 ||
-                   get(key(p, k)) != std::to_string(p * 1000 + k) || xmldbc_del(S, 0, "/c/scratch") != 0;
+                   xmldb_get(key(p, k)) != std::to_string(p * 1000 + k) || xmldbc_del(S, 0, "/c/scratch") != 0;
         ::_exit(bad == 0 ? 0 : 1);
     }
     for (pid_t k : kids) {
@@ -233,7 +228,7 @@ TEST(XmldbConcurrency, ParallelWritersLoseNothing)
     }
     for (int p = 0; p < 6; ++p)
         for (int k = 0; k < 150; ++k)
-            ASSERT_EQ(get(key(p, k)), std::to_string(p * 1000 + k)) << key(p, k);
+            ASSERT_EQ(xmldb_get(key(p, k)), std::to_string(p * 1000 + k)) << key(p, k);
 }
 
 // The service as started by hand, loading the saved file by default: every
@@ -262,7 +257,7 @@ TEST(XmldbDurability, EveryRestartLoadsASavedStateAndKeepsWhatItHolds)
         EXPECT_GE(gen, last_saved) << "an acknowledged save was lost";
         for (int i = 0; gen > 0 && i < 4; ++i)
             ASSERT_EQ(t.get("/blob/" + std::to_string(i)), blob(gen, i)) << "gen " << gen;
-        ASSERT_EQ(get("/gen"), gen ? std::to_string(gen) : "") << "the restarted service did not load it";
+        ASSERT_EQ(xmldb_get("/gen"), gen ? std::to_string(gen) : "") << "the restarted service did not load it";
         const auto delay = static_cast<useconds_t>(rng() % 20000);
         const pid_t victim = db.pid(), killer = ::fork();
         if (killer == 0) {

@@ -78,6 +78,15 @@ bool XmldbProcess::ready()
 void XmldbProcess::kill() { proc_.kill(); }
 int XmldbProcess::stop() { return proc_.stop(); }
 
+std::string xmldb_get(const std::string &path, int *rc)
+{
+    char buf[512];
+    const int r = xmldbc_get_wb(XMLDB_SOCK_ISCSI, 0, path.c_str(), buf, sizeof buf);
+    if (rc)
+        *rc = r;
+    return r < 0 ? "<failed>" : buf;
+}
+
 XmldbService::XmldbService(bool sysinfo, std::string load_file)
     : config_(SysRoot::file(XMLDB_SOCK_ISCSI),
               load_file.empty() ? std::vector<std::string>{"--empty"} : std::vector<std::string>{"--load", load_file}),

@@ -54,6 +54,10 @@ private:
     int ready_fd_ = -1;
 };
 
+// The value at path in the configuration database, "<failed>" when the call
+// fails; rc (if given) gets xmldbc_get_wb's result.
+std::string xmldb_get(const std::string &path, int *rc = nullptr);
+
 // The configuration database service (and optionally the sysinfo one) in the
 // process's SysRoot, each with an empty tree; load_file (a real path) is an
 // XML file the configuration service loads at every start instead.
