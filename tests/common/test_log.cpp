@@ -31,33 +31,27 @@ TEST_F(LogTest, PrintsUnitFunctionLineThenMessage)
     EXPECT_EQ(out, "(test_log:operator():" + std::to_string(line) + "):get debug level = 2\n");
 }
 
-TEST_F(LogTest, UnitNameIsTheFileWithoutDirectoryOrExtension)
+TEST_F(LogTest, UnitIsTheFileWithoutDirectoryOrExtensionAndTheMessageIsKeptAsIs)
 {
     g_korv_debug_level = 0;
-    std::string out = capture_stdout([] { korv_log(0, "/a/b/korvadm_xmldb_conf.cpp", "f", 7, "x"); });
-    EXPECT_EQ(out, "(korvadm_xmldb_conf:f:7):x\n");
+    EXPECT_EQ(capture_stdout([] { korv_log(0, "/a/b/korvadm_xmldb_conf.cpp", "f", 7, "x"); }),
+              "(korvadm_xmldb_conf:f:7):x\n");
+    // A format ending in a newline leaves an empty line.
+    EXPECT_EQ(capture_stdout([] { korv_log(0, "u.cpp", "f", 1, "Error unknown access right = %d\n", 9); }),
+              "(u:f:1):Error unknown access right = 9\n\n");
 }
 
-TEST_F(LogTest, NothingAtAllAboveTheDebugLevel)
+TEST_F(LogTest, NothingAtAllAboveTheDebugLevelAndANegativeLevelSilencesErrorsToo)
 {
-    g_korv_debug_level = 1;
-    EXPECT_EQ(capture_stdout([] { DBG(2, "hidden %s", "x"); }), "");
-    EXPECT_EQ(capture_stdout([] { DBG(4, "hidden"); }), "");
-    EXPECT_NE(capture_stdout([] { DBG(1, "shown"); }), "");
-    EXPECT_NE(capture_stdout([] { DBG(0, "shown"); }), "");
-}
-
-TEST_F(LogTest, NegativeLevelSilencesErrorsToo)
-{
-    g_korv_debug_level = -1;
-    EXPECT_EQ(capture_stdout([] { DBG(0, "malloc target_conf_t failed"); }), "");
-}
-
-TEST_F(LogTest, FormatEndingInNewlineLeavesAnEmptyLine)
-{
-    g_korv_debug_level = 0;
-    std::string out = capture_stdout([] { korv_log(0, "u.cpp", "f", 1, "Error unknown access right = %d\n", 9); });
-    EXPECT_EQ(out, "(u:f:1):Error unknown access right = 9\n\n");
+    const struct {
+        int debug_level, level;
+        bool shown;
+    } cases[] = {{1, 2, false}, {1, 4, false}, {1, 1, true}, {1, 0, true}, {-1, 0, false}};
+    for (const auto &c : cases) {
+        g_korv_debug_level = c.debug_level;
+        EXPECT_EQ(capture_stdout([&] { DBG(c.level, "shown %s", "x"); }).empty(), !c.shown)
+            << c.debug_level << " " << c.level;
+    }
 }
 
 TEST_F(LogTest, FlushesEvenWhenNothingPrints)
