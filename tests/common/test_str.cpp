@@ -1,8 +1,11 @@
-// The shared text helpers: the bounded copy, the shell escaping, and the
-// argument guard.
+// The shared text helpers (the bounded copy, the shell escaping, the pipe
+// reader) and the argument guard.
 #include "common/korvadm_str.h"
 
+#include <csignal>
 #include <cstring>
+#include <string>
+#include <vector>
 
 #include <gtest/gtest.h>
 
@@ -51,6 +54,27 @@ TEST(ShellEscape, BackslashesExactlyTheCharactersLiveInDoubleQuotes)
     EXPECT_EQ(out, "kept");
     EXPECT_TRUE(korv::shell_escape("$(id)", out));
     EXPECT_EQ(out, "\\$(id)");
+}
+
+TEST(ReadCommandLines, LineByLineWithTheExitStatus)
+{
+    std::vector<std::string> lines;
+    auto collect = [&](std::string_view line) {
+        lines.emplace_back(line);
+        return true;
+    };
+    EXPECT_EQ(korv::read_command_lines("printf 'a b\\n\\nlast'; exit 3", collect), 3);
+    EXPECT_EQ(lines, (std::vector<std::string>{"a b", "", "last"}));
+
+    // Stopping early leaves the rest unread; the status still comes back.
+    lines.clear();
+    int status = korv::read_command_lines("seq 1 100000", [&](std::string_view line) {
+        lines.emplace_back(line);
+        return false;
+    });
+    EXPECT_EQ(lines, (std::vector<std::string>{"1"}));
+    EXPECT_TRUE(status == 0 || status == 128 + SIGPIPE) << status;
+    EXPECT_EQ(korv::read_command_lines(nullptr, collect), -1);
 }
 
 int guarded(const char *name, int n)

@@ -13,8 +13,6 @@
 #include <chrono>
 #include <cstring>
 #include <string>
-#include <string_view>
-#include <vector>
 
 #include <gtest/gtest.h>
 
@@ -145,27 +143,6 @@ TEST_F(UtilsTest, RunSystemCmdQuotesItsArgumentWhateverTheFormat)
     for (const char *f : {": '%s'", ": \"%s\"", "touch %s %d", "exit 3 # %s"})
         EXPECT_EQ(run_system_cmd(f, ("x; touch " + canary).c_str()), -1) << f;
     EXPECT_FALSE(exists(canary));
-}
-
-TEST_F(UtilsTest, CommandOutputComesLineByLineWithTheExitStatus)
-{
-    std::vector<std::string> lines;
-    auto collect = [&](std::string_view line) {
-        lines.emplace_back(line);
-        return true;
-    };
-    EXPECT_EQ(korv::read_command_lines("printf 'a b\\n\\nlast'; exit 3", collect), 3);
-    EXPECT_EQ(lines, (std::vector<std::string>{"a b", "", "last"}));
-
-    // Stopping early leaves the rest unread; the status still comes back.
-    lines.clear();
-    int status = korv::read_command_lines("seq 1 100000", [&](std::string_view line) {
-        lines.emplace_back(line);
-        return false;
-    });
-    EXPECT_EQ(lines, (std::vector<std::string>{"1"}));
-    EXPECT_TRUE(status == 0 || status == 128 + SIGPIPE) << status;
-    EXPECT_EQ(korv::read_command_lines(nullptr, collect), -1);
 }
 
 TEST_F(UtilsTest, RetriedCommandRunsUntilSuccessOrTriesRunOut)
