@@ -53,17 +53,16 @@ int read_command_lines(const char *cmd, const std::function<bool(std::string_vie
     std::FILE *p = popen(cmd, "r");
     if (!p)
         return -1;
-    char *line = nullptr;
-    size_t cap = 0;
-    ssize_t n;
-    while ((n = getline(&line, &cap, p)) >= 0) {
-        std::string_view text(line, static_cast<size_t>(n));
+    // Output is untrusted: a line longer than the buffer comes in pieces, so
+    // an endless line neither grows memory nor stops on_line from ending it.
+    char buf[kCommandLineMax + 1];
+    while (std::fgets(buf, sizeof buf, p)) {
+        std::string_view text(buf);
         if (!text.empty() && text.back() == '\n')
             text.remove_suffix(1);
         if (!on_line(text))
             break;
     }
-    std::free(line);
     int status = pclose(p);
     if (status == -1)
         return -1;

@@ -52,7 +52,9 @@ bool shell_escape(const char *src, std::string &out);
  * until on_line returns false. Returns the command's exit status as System()
  * does (0..255, 128+N when it died of signal N; a command cut short by a
  * false from on_line may die of SIGPIPE), or -1 when it could not be run.
+ * A line longer than kCommandLineMax bytes comes in pieces of that size.
  * cmd is run as given: values in it must be escaped (shell_escape). */
+constexpr size_t kCommandLineMax = 4096;
 int read_command_lines(const char *cmd, const std::function<bool(std::string_view line)> &on_line);
 
 /* Memory from malloc/calloc/strdup, freed when it goes out of scope. */

@@ -74,6 +74,14 @@ TEST(ReadCommandLines, LineByLineWithTheExitStatus)
     });
     EXPECT_EQ(lines, (std::vector<std::string>{"1"}));
     EXPECT_TRUE(status == 0 || status == 128 + SIGPIPE) << status;
+    // An endless line comes in bounded pieces, so the reader can stop it.
+    lines.clear();
+    status = korv::read_command_lines("yes x | tr -d '\\n'", [&](std::string_view line) {
+        lines.emplace_back(line);
+        return lines.size() < 2;
+    });
+    EXPECT_EQ(lines, std::vector<std::string>(2, std::string(korv::kCommandLineMax, 'x')));
+    EXPECT_EQ(status, 128 + SIGPIPE);
     EXPECT_EQ(korv::read_command_lines(nullptr, collect), -1);
 }
 

@@ -10,7 +10,6 @@
 #include <cstring>
 #include <filesystem>
 #include <fstream>
-#include <map>
 #include <sstream>
 
 #include <gtest/gtest.h>
@@ -176,15 +175,18 @@ protected:
         mounted_ = {ext4_};
         ASSERT_EQ(mount("tmpfs", tmpfs_.c_str(), "tmpfs", 0, "size=4m"), 0);
         mounted_.push_back(tmpfs_);
-        std::map<std::string, std::string> subst = {{"@EXT4@", ext4_}, {"@TMPFS@", tmpfs_}, {"@NONE@", none_}};
         std::ifstream in(kData + "/sysinfo_volumes.txt");
-        for (std::string l; std::getline(in, l);) {
-            for (const auto &[from, to] : subst)
-                if (size_t at = l.find(from); at != std::string::npos)
-                    l.replace(at, from.size(), to);
+        for (std::string l; std::getline(in, l);)
             if (!l.empty() && l[0] != '#')
-                put(l.substr(0, l.find(" = ")), l.substr(l.find(" = ") + 3));
-        }
+                put(l.substr(0, l.find(" = ")), subst(l.substr(l.find(" = ") + 3)));
+    }
+    // The mount points for their @NAME@ placeholders.
+    std::string subst(std::string text) const
+    {
+        for (const auto &[from, to] : {std::pair{"@EXT4@", ext4_}, {"@TMPFS@", tmpfs_}, {"@NONE@", none_}})
+            if (size_t at = text.find(from); at != std::string::npos)
+                text.replace(at, std::strlen(from), to);
+        return text;
     }
     void TearDown() override
     {
@@ -215,23 +217,16 @@ TEST_F(RealMounts, DfFiguresMatchDfAndShareReservedBlocks)
 
 TEST_F(RealMounts, MountPathAndLockStateByUuid)
 {
-    const struct {
-        const char *uuid;
-        int found;
+    for (auto [uuid, want] : cases("mount_lookups.txt")) {
+        uuid = uuid == "\"\"" ? "" : uuid;
+        std::istringstream w(subst(want));
+        int found, unlocked;
         std::string path;
-        int unlocked;
-    } table[] = {
-        {"u-ext4", 5, ext4_, 10}, {"u-tmpfs", 5, tmpfs_, 10}, {"u-locked", 6, "", 9},
-        {"u-dup", 5, ext4_, 10},   // the last mounted one; the first decides the lock
-        {"u-dup2", 5, tmpfs_, 9},  // the first one is not mounted
-        {"u-late", 6, "", 9},      // behind an empty name
-        {"", 6, "", 9},           {"u-nowhere", 6, "", 9},
-    };
-    for (const auto &c : table) {
+        w >> found >> path >> unlocked;
         char out[VOL_MNT_PATH_LEN] = "stale";
-        EXPECT_EQ(quiet([&] { return sys_raid_get_mnt_path_by_uuid(out, sizeof out, c.uuid); }), c.found) << c.uuid;
-        EXPECT_EQ(out, c.path) << c.uuid;
-        EXPECT_EQ(quiet([&] { return sys_raid_vol_is_unlocked_by_uuid(c.uuid); }), c.unlocked) << c.uuid;
+        EXPECT_EQ(quiet([&] { return sys_raid_get_mnt_path_by_uuid(out, sizeof out, uuid.c_str()); }), found) << uuid;
+        EXPECT_EQ(out, path == "-" ? "" : path) << uuid;
+        EXPECT_EQ(quiet([&] { return sys_raid_vol_is_unlocked_by_uuid(uuid.c_str()); }), unlocked) << uuid;
     }
     char small[8];
     EXPECT_EQ(quiet([&] { return sys_raid_get_mnt_path_by_uuid(small, sizeof small, "u-ext4"); }), 6);
