@@ -89,13 +89,13 @@ int acl_field_exists(const char *func, const char *field, const char *value)
 
 int _xmldb_acl_get_dbidx_by_name(const char *initiator)
 {
-    PARAM_ERROR_IF(!initiator);
+    PARAM_GUARD(!initiator);
     return find_entry(__func__, kAcls, initiator, "can not find %s in xmldb acl entry", 2);
 }
 
 int _xmldb_lun_acl_get_dbidx(int lun, const char *initiator)
 {
-    PARAM_ERROR_IF(!initiator || lun < 1);
+    PARAM_GUARD(!initiator || lun < 1);
     char root[kPathLen];
     int n = 0;
     int rc = _search_xmldb_id_entry(&n, lun_acl_root(root, lun), CONF_MAX_ACLS, "initiator", initiator);
@@ -111,7 +111,7 @@ int _xmldb_lun_acl_get_dbidx(int lun, const char *initiator)
 
 int _xmldb_acl_get_mapped_lun_dbidx(int acl, const char *lun_name)
 {
-    PARAM_ERROR_IF(!lun_name || acl < 1);
+    PARAM_GUARD(!lun_name || acl < 1);
     char root[kPathLen];
     int n = 0;
     int rc = _search_xmldb_id_entry(&n, mapped_lun_root(root, acl), CONF_MAX_LUNS, "lun_name", lun_name);
@@ -139,25 +139,25 @@ int _xmldb_update_current_acl_mapluncnt(int acl)
 
 int xmldb_check_acl_initiaor_exist(const char *initiator)
 {
-    PARAM_ERROR_IF(!initiator);
+    PARAM_GUARD(!initiator);
     return initiator[0] ? acl_field_exists(__func__, kAcls.key, initiator) : 0;
 }
 
 int xmldb_check_acl_alias_exist(const char *alias)
 {
-    PARAM_ERROR_IF(!alias);
+    PARAM_GUARD(!alias);
     return alias[0] ? acl_field_exists(__func__, "alias", alias) : 0;
 }
 
 int xmldb_check_add_acl_initiator(const char *initiator, const char *alias)
 {
-    PARAM_ERROR_IF(!initiator || !alias);
+    PARAM_GUARD(!initiator || !alias);
     return xmldb_check_acl_initiaor_exist(initiator) == 1 || xmldb_check_acl_alias_exist(alias) == 1 ? 1 : 0;
 }
 
 int xmldb_add_acl_initiator(const char *initiator, const char *alias)
 {
-    PARAM_ERROR_IF(!initiator || !alias || !initiator[0] || !fits<CONF_IQN_LEN>(initiator));
+    PARAM_GUARD(!initiator || !alias || !initiator[0] || !fits<CONF_IQN_LEN>(initiator));
     int n = 0;
     int rc = _get_free_xmldb_id_entry(&n, kAcls.root, kAcls.max, kAcls.key);
     if (rc == ID_ENTRY_NOT_FOUND) {
@@ -217,7 +217,7 @@ int write_right(const char *initiator, const char *alias, const char *lun_name, 
 
 int xmldb_set_lun_acl(const char *initiator, const char *alias, const char *lun_name, int access_right)
 {
-    PARAM_ERROR_IF(!initiator || !alias || !lun_name);
+    PARAM_GUARD(!initiator || !alias || !lun_name);
     const char *invalid = !initiator[0] || !fits<CONF_IQN_LEN>(initiator) ? "initiator name error"
                           : !lun_name[0] || !fits<CONF_NAME_LEN>(lun_name) ? "lun name error"
                           : access_right < 0 || access_right > 2           ? "access right error"
@@ -248,7 +248,7 @@ int xmldb_set_lun_acl(const char *initiator, const char *alias, const char *lun_
 
 int xmldb_del_acl_initiator(const char *initiator)
 {
-    PARAM_ERROR_IF(!initiator);
+    PARAM_GUARD(!initiator);
     int acl = find_entry(__func__, kAcls, initiator, "can not find %s in xmldb acl entry");
     if (acl < 1)
         return acl;
@@ -285,7 +285,7 @@ int xmldb_del_acl_initiator(const char *initiator)
 
 int xmldb_remove_lun_from_all_acl(const char *lun_name)
 {
-    PARAM_ERROR_IF(!lun_name);
+    PARAM_GUARD(!lun_name);
     int lun = find_entry(__func__, kLuns, lun_name, "can not find lun name = %s - error");
     if (lun < 1)
         return lun;
@@ -323,8 +323,8 @@ int xmldb_remove_lun_from_all_acl(const char *lun_name)
 
 int xmldb_get_all_acl_initiator_conf_lite(list_t *list)
 {
-    PARAM_ERROR_IF(!list);
-    return read_into(list, acl_initiator_conf_free_list, [&](list_t *got) {
+    PARAM_GUARD(!list);
+    return korv::fill_and_hand_over(list, acl_initiator_conf_free_list, [&](list_t *got) {
         return walk_list(__func__, kAcls.root, kAcls.max, kAcls.key, CONF_IQN_LEN, "get alias error",
                          [&](int n, const char *initiator) -> int {
                              char alias[kKeyLen] = "";
@@ -338,8 +338,8 @@ int xmldb_get_all_acl_initiator_conf_lite(list_t *list)
                                  return ERR_NO_MEMORY;
                              }
                              conf->dbidx = n;
-                             copy_cut(conf->initiator, initiator);
-                             copy_cut(conf->alias, alias);
+                             korv::copy_bounded(conf->initiator, initiator);
+                             korv::copy_bounded(conf->alias, alias);
                              list_append(&conf->node, got);
                              return KORV_OK;
                          });
@@ -348,13 +348,13 @@ int xmldb_get_all_acl_initiator_conf_lite(list_t *list)
 
 int xmldb_get_all_lun_acl_conf_from_lun(const char *lun_name, list_t *list)
 {
-    PARAM_ERROR_IF(!lun_name || !list);
+    PARAM_GUARD(!lun_name || !list);
     int lun = find_entry(__func__, kLuns, lun_name, "get lun db idx error");
     if (lun < 1)
         return lun;
     char root[kPathLen];
     lun_acl_root(root, lun);
-    return read_into(list, lun_acl_conf_free_list, [&](list_t *got) {
+    return korv::fill_and_hand_over(list, lun_acl_conf_free_list, [&](list_t *got) {
         return walk_list(__func__, root, CONF_MAX_ACLS, "initiator", CONF_IQN_LEN, nullptr,
                          [&](int k, const char *initiator) -> int {
                              char alias[kKeyLen] = "", right[kKeyLen] = "";
@@ -376,8 +376,8 @@ int xmldb_get_all_lun_acl_conf_from_lun(const char *lun_name, list_t *list)
                                  return ERR_NO_MEMORY;
                              }
                              conf->dbidx = k;
-                             copy_cut(conf->initiator, initiator);
-                             copy_cut(conf->alias, alias);
+                             korv::copy_bounded(conf->initiator, initiator);
+                             korv::copy_bounded(conf->alias, alias);
                              conf->access_right = parsed;
                              list_append(&conf->node, got);
                              return KORV_OK;
@@ -387,7 +387,7 @@ int xmldb_get_all_lun_acl_conf_from_lun(const char *lun_name, list_t *list)
 
 int xmldb_get_initiator_name_from_alias(char *buf, size_t size, const char *alias)
 {
-    PARAM_ERROR_IF(!buf || size == 0 || !alias);
+    PARAM_GUARD(!buf || size == 0 || !alias);
     buf[0] = '\0';
     if (!alias[0]) {
         DBG(0, "alias is empty");

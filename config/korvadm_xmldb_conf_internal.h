@@ -14,17 +14,10 @@
 #include <initializer_list>
 
 #include "common/korvadm_err.h"
+#include "common/korvadm_list.h"
 #include "common/korvadm_log.h"
+#include "common/korvadm_str.h"
 #include "config/korvadm_xmldb_conf.h"
-
-// An operation's argument guard: logged under the operation, -9989.
-#define PARAM_ERROR_IF(refused)        \
-    do {                               \
-        if (refused) {                 \
-            DBG(0, "parameter error"); \
-            return ERR_PARAM;          \
-        }                              \
-    } while (0)
 
 extern "C" {
 /* ---- korvadm_xmldb_conf_scan.cpp: scanner and counters ---- */
@@ -129,15 +122,6 @@ bool fits(const char *text)
     return strnlen(text, N) < N;
 }
 
-// Copies text into a record field, cut to it.
-template <size_t N>
-void copy_cut(char (&field)[N], const char *text)
-{
-    size_t len = strnlen(text, N - 1);
-    std::memcpy(field, text, len);
-    field[len] = '\0';
-}
-
 // A failure of the service itself (or of memory) fails a whole list read;
 // any other failure only costs the record that could not be filled.
 inline bool whole_read_failure(int rc)
@@ -174,26 +158,6 @@ int walk_list(const char *func, const char *root, int max, const char *key, size
             return rc;
         if (rc != KORV_OK && skip_fmt)
             DBG_AS(func, 0, skip_fmt, value);
-    }
-    return KORV_OK;
-}
-
-// Runs read(&got) on a private list and hands its records to out only on
-// success, so a failed read never leaves half a set with the caller.
-template <class Read>
-int read_into(list_t *out, void (*free_list)(list_t *), Read read)
-{
-    list_t got;
-    list_init(&got);
-    int rc = read(&got);
-    if (rc != KORV_OK) {
-        free_list(&got);
-        return rc;
-    }
-    while (!list_is_empty(&got)) {
-        list_node_t *node = got.head;
-        list_remove(node);
-        list_append(node, out);
     }
     return KORV_OK;
 }

@@ -149,25 +149,25 @@ int xmldb_set_lun_status(const char *status, const char *name) { return set_lun_
 
 int _xmldb_get_lun_dbidx_by_name(const char *name)
 {
-    PARAM_ERROR_IF(!name);
+    PARAM_GUARD(!name);
     return find_entry(__func__, kLuns, name, "can not find %s in xmldb lun entry", 2);
 }
 
 int xmldb_check_lun_exist(const char *name)
 {
-    PARAM_ERROR_IF(!name);
+    PARAM_GUARD(!name);
     return name[0] && xmldb_check_add_lun(name) == 1 ? 1 : 0;
 }
 
 int xmldb_check_add_lun(const char *name)
 {
-    PARAM_ERROR_IF(!name || !name[0]);
+    PARAM_GUARD(!name || !name[0]);
     return check_entry(__func__, kLuns.root, kLuns.max, kLuns.key, name);
 }
 
 int xmldb_add_new_lun(lun_conf_t *conf)
 {
-    PARAM_ERROR_IF(!conf);
+    PARAM_GUARD(!conf);
     // Every check before the first write, so a refused record leaves no trace.
     const char *invalid = !conf->name[0]                        ? "name is empty"
                           : !fits<CONF_NAME_LEN>(conf->name)    ? "name is too long"
@@ -193,10 +193,10 @@ int xmldb_add_new_lun(lun_conf_t *conf)
     }
     // Bounded copies: a record filled by hand may lack its terminators.
     char name[CONF_NAME_LEN], uuid[CONF_NAME_LEN], serial[CONF_NAME_LEN], img_file[CONF_IMG_FILE_LEN];
-    copy_cut(name, conf->name);
-    copy_cut(uuid, conf->uuid);
-    copy_cut(serial, conf->serial);
-    copy_cut(img_file, conf->img_file);
+    korv::copy_bounded(name, conf->name);
+    korv::copy_bounded(uuid, conf->uuid);
+    korv::copy_bounded(serial, conf->serial);
+    korv::copy_bounded(img_file, conf->img_file);
     const long long size = static_cast<long long>(conf->size);
     // The sector size reuses the size's message, as operators know it.
     rc = write_fields(__func__, kLuns.root, n,
@@ -221,7 +221,7 @@ int xmldb_add_new_lun(lun_conf_t *conf)
 
 int xmldb_del_lun_by_name(const char *name)
 {
-    PARAM_ERROR_IF(!name);
+    PARAM_GUARD(!name);
     int n = find_entry(__func__, kLuns, name, "can not find %s in xmldb target entry");
     if (n < 1)
         return n;
@@ -237,7 +237,7 @@ int xmldb_del_lun_by_name(const char *name)
 
 int xmldb_get_free_lun_devid(int *devid)
 {
-    PARAM_ERROR_IF(!devid);
+    PARAM_GUARD(!devid);
     return free_number(__func__, kLuns.root, "devid", CONF_MAX_LUNS, devid, "get free devid: %d");
 }
 

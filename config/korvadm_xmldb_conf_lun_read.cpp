@@ -46,7 +46,7 @@ int read_text(char (&field)[N], int n, const char *name)
 // Fills conf from entry n, whose name the caller has read and copied.
 int _xmldb_fill_lun_conf(lun_conf_t *conf, int n)
 {
-    PARAM_ERROR_IF(!conf || n < 1);
+    PARAM_GUARD(!conf || n < 1);
     const char *func = __func__;
     conf->dbidx = n;
     int rc;
@@ -81,7 +81,7 @@ int read_all_luns(const char *func, list_t *out, bool full)
         DBG_AS(func, 0, "parameter error");
         return ERR_PARAM;
     }
-    return read_into(out, lun_conf_free_list, [&](list_t *got) {
+    return korv::fill_and_hand_over(out, lun_conf_free_list, [&](list_t *got) {
         return walk_list(func, kLuns.root, kLuns.max, kLuns.key, CONF_NAME_LEN,
                          "fill lun conf failed when lun = %s", [&](int n, const char *name) -> int {
                              lun_conf_t *conf = lun_conf_new();
@@ -89,7 +89,7 @@ int read_all_luns(const char *func, list_t *out, bool full)
                                  DBG_AS(func, 0, "new l_conf failed");
                                  return ERR_NO_MEMORY;
                              }
-                             copy_cut(conf->name, name);
+                             korv::copy_bounded(conf->name, name);
                              conf->dbidx = n;
                              int rc = full ? _xmldb_fill_lun_conf(conf, n) : KORV_OK;
                              if (rc != KORV_OK) {
@@ -112,11 +112,11 @@ int xmldb_get_all_lun_conf_in_crash_conf(list_t *list) { return read_all_luns(__
 
 int xmldb_get_lun_conf_by_name(lun_conf_t *conf, const char *name)
 {
-    PARAM_ERROR_IF(!conf || !name || !name[0] || !fits<CONF_NAME_LEN>(name));
+    PARAM_GUARD(!conf || !name || !name[0] || !fits<CONF_NAME_LEN>(name));
     int n = find_entry(__func__, kLuns, name, "can not find %s in xmldb lun entry");
     if (n < 1)
         return n;
-    copy_cut(conf->name, name);
+    korv::copy_bounded(conf->name, name);
     int rc = _xmldb_fill_lun_conf(conf, n);
     if (rc != KORV_OK)
         DBG(0, "fill lun conf failed when lun = %s", name);
@@ -125,7 +125,7 @@ int xmldb_get_lun_conf_by_name(lun_conf_t *conf, const char *name)
 
 int xmldb_get_lun_conf_by_uuid(lun_conf_t *conf, const char *uuid)
 {
-    PARAM_ERROR_IF(!conf || !uuid || !uuid[0]);
+    PARAM_GUARD(!conf || !uuid || !uuid[0]);
     // Walks the LUNs by name (the list's key) and takes the first whose
     // volume UUID matches; a LUN whose name does not fit the record is passed.
     int found = 0;
@@ -141,7 +141,7 @@ int xmldb_get_lun_conf_by_uuid(lun_conf_t *conf, const char *uuid)
                                return read_rc;
                            if (std::strcmp(got, uuid) == 0) {
                                found = n;
-                               copy_cut(conf->name, name);
+                               korv::copy_bounded(conf->name, name);
                            }
                            return KORV_OK;
                        });

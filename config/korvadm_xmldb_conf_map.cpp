@@ -40,7 +40,7 @@ const char *map_root(char (&buf)[N], int target)
 
 int xmldb_get_free_lun_num(int *lun_num, const char *target_name)
 {
-    PARAM_ERROR_IF(!lun_num || !target_name);
+    PARAM_GUARD(!lun_num || !target_name);
     int t = find_target(__func__, target_name);
     if (t < 1)
         return t;
@@ -138,7 +138,7 @@ int xmldb_del_target_lun_map(const char *target_name, const char *lun_name)
 
 int xmldb_get_mapping_target(char *target_name, size_t size, int *lun_num, const char *lun_name)
 {
-    PARAM_ERROR_IF(!target_name || size == 0 || !lun_num);
+    PARAM_GUARD(!target_name || size == 0 || !lun_num);
     if (!lun_name || !lun_name[0]) {
         DBG(0, "lun name error");
         return ERR_PARAM;
@@ -166,13 +166,13 @@ int xmldb_get_mapping_target(char *target_name, size_t size, int *lun_num, const
 
 int xmldb_get_target_map_lun_conf(const char *target_name, list_t *list)
 {
-    PARAM_ERROR_IF(!target_name || !list);
+    PARAM_GUARD(!target_name || !list);
     int t = find_entry(__func__, kTargets, target_name, "can not find target named : %s");
     if (t < 1)
         return t;
     char root[kPathLen];
     map_root(root, t);
-    return read_into(list, target_map_lun_conf_free_list, [&](list_t *got) {
+    return korv::fill_and_hand_over(list, target_map_lun_conf_free_list, [&](list_t *got) {
         return walk_list(__func__, root, CONF_MAX_MAP_LUNS, "lun_name", CONF_NAME_LEN, nullptr,
                          [&](int m, const char *lun) -> int {
                              char path[kPathLen];
@@ -188,8 +188,8 @@ int xmldb_get_target_map_lun_conf(const char *target_name, list_t *list)
                                  return ERR_NO_MEMORY;
                              }
                              conf->dbidx = m;
-                             copy_cut(conf->target_name, target_name);
-                             copy_cut(conf->lun_name, lun);
+                             korv::copy_bounded(conf->target_name, target_name);
+                             korv::copy_bounded(conf->lun_name, lun);
                              conf->lun_num = num;
                              list_append(&conf->node, got);
                              return KORV_OK;

@@ -23,7 +23,7 @@ bool xmldb_conf::read_key(const char *root, int id, const char *key, char (&valu
 
 int _search_xmldb_id_entry(int *out_id, const char *root, int max, const char *key, const char *value)
 {
-    PARAM_ERROR_IF(!out_id || !root || !key || !value);
+    PARAM_GUARD(!out_id || !root || !key || !value);
     *out_id = 0;
     for (int n = 1; n <= max; n++) {
         char got[kKeyLen];
@@ -40,7 +40,7 @@ int _search_xmldb_id_entry(int *out_id, const char *root, int max, const char *k
 
 int _get_free_xmldb_id_entry(int *out_id, const char *root, int max, const char *key)
 {
-    PARAM_ERROR_IF(!out_id || !root || !key);
+    PARAM_GUARD(!out_id || !root || !key);
     *out_id = 0;
     if (max <= 0)
         return ID_ENTRY_NOT_FOUND;

@@ -45,7 +45,7 @@ int set_logged(const char *func, const char *path, const char *value)
 
 int xmldb_update_sess_acl_lun_access_status(const char *initiator, const char *lun_name, unsigned status)
 {
-    PARAM_ERROR_IF(!initiator || !lun_name || !initiator[0] || !lun_name[0] || !fits<CONF_IQN_LEN>(initiator) ||
+    PARAM_GUARD(!initiator || !lun_name || !initiator[0] || !lun_name[0] || !fits<CONF_IQN_LEN>(initiator) ||
                    !fits<CONF_NAME_LEN>(lun_name));
     char path[kPathLen];
     int s = find_or_next(kSessions.root, kSessions.max, kSessions.key, initiator);

@@ -116,14 +116,14 @@ int xmldb_set_service_progress(int progress)
 
 int xmldb_get_nesrad_pid(int *pid)
 {
-    PARAM_ERROR_IF(!pid);
+    PARAM_GUARD(!pid);
     *pid = static_cast<int>(dbGetLL(kIsnsPid));
     return KORV_OK;
 }
 
 int xmldb_set_nesrad_pid(int pid)
 {
-    PARAM_ERROR_IF(pid < 0);
+    PARAM_GUARD(pid < 0);
     dbSetLL(pid, kIsnsPid);
     DBG(2, "set nesrad pid = %d", pid);
     return KORV_OK;
@@ -131,7 +131,7 @@ int xmldb_set_nesrad_pid(int pid)
 
 int xmldb_get_nesrad_enable(int *enable)
 {
-    PARAM_ERROR_IF(!enable);
+    PARAM_GUARD(!enable);
     *enable = dbGetLL(kIsnsEnable) != 0;
     return KORV_OK;
 }
@@ -144,7 +144,7 @@ int xmldb_set_nesrad_enable(int enable)
 
 int xmldb_get_nesrad_ip(char *buf, size_t size)
 {
-    PARAM_ERROR_IF(!buf || size == 0);
+    PARAM_GUARD(!buf || size == 0);
     std::memset(buf, 0, size);
     dbGetStr(buf, platform_size(size), kIsnsIp);
     return KORV_OK;
@@ -152,7 +152,7 @@ int xmldb_get_nesrad_ip(char *buf, size_t size)
 
 int xmldb_set_nesrad_ip(const char *ip)
 {
-    PARAM_ERROR_IF(!ip);
+    PARAM_GUARD(!ip);
     dbSetStr(ip, kIsnsIp);
     return KORV_OK;
 }
@@ -183,7 +183,7 @@ int xmldb_set_debug_level(int level)
 
 int xmldb_get_korvadm_ver(int *ver)
 {
-    PARAM_ERROR_IF(!ver);
+    PARAM_GUARD(!ver);
     char value[kPathLen] = "";
     DBG(2, "get strNode: %s", kVersion);
     if (xmldb_get_cstring(value, sizeof value, kVersion) != KORV_OK)
@@ -208,7 +208,7 @@ int xmldb_set_korvadm_ver(int ver)
 
 int xmldb_get_saved_host_name(char *buf, size_t size)
 {
-    PARAM_ERROR_IF(!buf || size < kSavedHostNameLen);
+    PARAM_GUARD(!buf || size < kSavedHostNameLen);
     std::memset(buf, 0, size);
     if (xmldb_get_cstring(buf, size, kHostName) != KORV_OK) {
         DBG(0, "get saved host name error");
@@ -219,13 +219,13 @@ int xmldb_get_saved_host_name(char *buf, size_t size)
 
 int xmldb_set_saved_host_name(const char *host_name)
 {
-    PARAM_ERROR_IF(!host_name);
+    PARAM_GUARD(!host_name);
     return xmldb_set_cstring(host_name, kHostName) == KORV_OK ? KORV_OK : ERR_DB_WRITE;
 }
 
 int xmldb_get_iqn_prefix(char *buf, size_t size)
 {
-    PARAM_ERROR_IF(!buf || size < CONF_GEN_IQN_LEN);
+    PARAM_GUARD(!buf || size < CONF_GEN_IQN_LEN);
     buf[0] = '\0';
     if (xmldb_get_cstring(buf, size, kIqnPrefix) != KORV_OK) {
         DBG(0, "get saved iqn error");
@@ -236,7 +236,7 @@ int xmldb_get_iqn_prefix(char *buf, size_t size)
 
 int xmldb_set_iqn_prefix(const char *prefix)
 {
-    PARAM_ERROR_IF(!prefix);
+    PARAM_GUARD(!prefix);
     return xmldb_set_cstring(prefix, kIqnPrefix) == KORV_OK ? KORV_OK : ERR_DB_WRITE;
 }
 

@@ -77,7 +77,7 @@ int get_target_text(const char *func, int n, const char *field, char *buf, size_
 
 int _xmldb_get_target_dbidx_by_name(const char *name)
 {
-    PARAM_ERROR_IF(!name);
+    PARAM_GUARD(!name);
     int n = 0;
     int rc = _search_xmldb_id_entry(&n, kTargetRoot, CONF_MAX_TARGETS, "name", name);
     if (rc == ID_ENTRY_FOUND)
@@ -91,7 +91,7 @@ int _xmldb_get_target_dbidx_by_name(const char *name)
 
 int xmldb_check_target_exist(const char *name)
 {
-    PARAM_ERROR_IF(!name);
+    PARAM_GUARD(!name);
     // No target is named "": a plain "no", so callers testing the result as a
     // truth value are not told it exists.
     return name[0] && xmldb_check_add_target(name) == 1 ? 1 : 0;
@@ -99,13 +99,13 @@ int xmldb_check_target_exist(const char *name)
 
 int xmldb_check_add_target(const char *name)
 {
-    PARAM_ERROR_IF(!name || !name[0]);
+    PARAM_GUARD(!name || !name[0]);
     return check_entry(__func__, kTargetRoot, CONF_MAX_TARGETS, "name", name);
 }
 
 int xmldb_add_new_target(target_conf_t *conf)
 {
-    PARAM_ERROR_IF(!conf);
+    PARAM_GUARD(!conf);
     // Every check before the first write, so a refused record leaves no trace.
     const bool chap = conf->chap_enable == 1;
     // A name that fills the record's field would be cut by every reader.
@@ -188,7 +188,7 @@ int xmldb_add_new_target(target_conf_t *conf)
 
 int xmldb_del_target_by_name(const char *name)
 {
-    PARAM_ERROR_IF(!name);
+    PARAM_GUARD(!name);
     int n = find_target(__func__, name);
     if (n < 1)
         return n;
@@ -212,13 +212,13 @@ int xmldb_set_target_hba_id(int hba_id, const char *name) { return set_target_in
 
 int xmldb_get_free_target_hba_id(int *hba_id)
 {
-    PARAM_ERROR_IF(!hba_id);
+    PARAM_GUARD(!hba_id);
     return free_number(__func__, kTargetRoot, "hba_id", CONF_MAX_TARGETS, hba_id, "get free hba_id: %d");
 }
 
 int xmldb_get_target_iqn(char *buf, size_t size, const char *name)
 {
-    PARAM_ERROR_IF(!buf || !name);
+    PARAM_GUARD(!buf || !name);
     if (size < CONF_IQN_LEN) {
         DBG(0, "parameter length error");
         return ERR_PARAM;
@@ -233,7 +233,7 @@ int xmldb_get_target_iqn(char *buf, size_t size, const char *name)
 
 int xmldb_set_target_iqn(const char *iqn, const char *name)
 {
-    PARAM_ERROR_IF(!iqn || !name);
+    PARAM_GUARD(!iqn || !name);
     int n = _xmldb_get_target_dbidx_by_name(name);
     if (n < 1) {
         DBG(0, "can not find %s", name);
@@ -249,7 +249,7 @@ int xmldb_set_target_iqn(const char *iqn, const char *name)
 
 int xmldb_set_target_chap(int chap_enable, const char *chap_name, const char *chap_pwd, const char *name)
 {
-    PARAM_ERROR_IF((chap_enable != 0 && chap_enable != 1) || !name ||
+    PARAM_GUARD((chap_enable != 0 && chap_enable != 1) || !name ||
                    (chap_enable == 1 && (!chap_name || !chap_pwd)));
     int n = _xmldb_get_target_dbidx_by_name(name);
     if (n < 1) {
@@ -314,7 +314,7 @@ int xmldb_update_current_targetcnt(void)
 
 int xmldb_get_target_status(char *buf, size_t size, const char *name)
 {
-    PARAM_ERROR_IF(!buf || !name);
+    PARAM_GUARD(!buf || !name);
     if (size < CONF_NAME_LEN) {
         DBG(0, "parameter length error");
         return ERR_PARAM;
@@ -327,7 +327,7 @@ int xmldb_get_target_status(char *buf, size_t size, const char *name)
 
 int xmldb_set_target_status(const char *status, const char *name)
 {
-    PARAM_ERROR_IF(!status || !name);
+    PARAM_GUARD(!status || !name);
     int n = find_target(__func__, name);
     if (n < 1)
         return n;
@@ -348,7 +348,7 @@ int xmldb_clean_target_conf(void)
 
 int xmldb_del_target_conn_info(const char *name)
 {
-    PARAM_ERROR_IF(!name);
+    PARAM_GUARD(!name);
     int n = 0;
     if (_search_xmldb_id_entry(&n, kTargetRoot, CONF_MAX_TARGETS, "name", name) != ID_ENTRY_FOUND || n < 1)
         return ID_ENTRY_NOT_FOUND;
@@ -362,7 +362,7 @@ int xmldb_del_target_conn_info(const char *name)
 
 int xmldb_set_target_conn_info(const char *name, int conn, const char *ip, const char *iqn)
 {
-    PARAM_ERROR_IF(!name || !ip || !iqn);
+    PARAM_GUARD(!name || !ip || !iqn);
     int n = 0;
     if (_search_xmldb_id_entry(&n, kTargetRoot, CONF_MAX_TARGETS, "name", name) != ID_ENTRY_FOUND || n < 1)
         return ID_ENTRY_NOT_FOUND;

@@ -65,7 +65,7 @@ int read_all_targets(const char *func, list_t *out, bool full)
         DBG_AS(func, 0, "parameter error");
         return ERR_PARAM;
     }
-    return read_into(out, target_conf_free_list, [&](list_t *got) {
+    return korv::fill_and_hand_over(out, target_conf_free_list, [&](list_t *got) {
         return walk_list(func, kTargetRoot, CONF_MAX_TARGETS, "name", CONF_NAME_LEN, nullptr,
                          [&](int n, const char *name) -> int {
                              target_conf_t *conf = target_conf_new();
@@ -73,7 +73,7 @@ int read_all_targets(const char *func, list_t *out, bool full)
                                  DBG_AS(func, 0, "new t_conf failed error");
                                  return ERR_NO_MEMORY;
                              }
-                             copy_cut(conf->name, name);
+                             korv::copy_bounded(conf->name, name);
                              int rc = fill_target_conf(func, conf, n, full);
                              if (rc != KORV_OK) {
                                  target_conf_free(conf);
@@ -88,11 +88,11 @@ int read_all_targets(const char *func, list_t *out, bool full)
 
 int xmldb_get_target_conf_by_name(target_conf_t *conf, const char *name)
 {
-    PARAM_ERROR_IF(!conf || !name || !fits<CONF_NAME_LEN>(name));
+    PARAM_GUARD(!conf || !name || !fits<CONF_NAME_LEN>(name));
     int n = find_target(__func__, name);
     if (n < 1)
         return n;
-    copy_cut(conf->name, name);
+    korv::copy_bounded(conf->name, name);
     return fill_target_conf(__func__, conf, n, true);
 }
 
