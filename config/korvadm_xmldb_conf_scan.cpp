@@ -83,7 +83,7 @@ namespace {
 int adjust_counter(const char *func, const char *path, int delta, const char *fail_fmt)
 {
     int32_t count = 0;
-    if (xmldb_get_int32_t(&count, path) != KORV_OK)
+    if (xmldb_get_int32_t(&count, path) != KORV_OK || count < 0)
         count = 0;
     if (delta > 0)
         count = count < INT32_MAX ? count + 1 : count;

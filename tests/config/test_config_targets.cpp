@@ -47,47 +47,6 @@ std::string read_targets(int (*reader)(list_t *), std::string *log = nullptr)
 
 }  // namespace
 
-using IdEntryScan = StoreTest;
-
-TEST_F(IdEntryScan, MatchesWholeValuesUpToTheLimitAndAnEmptyKeyHidesTheRest)
-{
-    put("/l/id:1/name", "a");
-    put("/l/id:2/name", "");
-    put("/l/id:3/name", "c");
-    int id = -1;
-    EXPECT_EQ(_search_xmldb_id_entry(&id, "/l", 10, "name", "a"), ID_ENTRY_FOUND);
-    EXPECT_EQ(id, 1);
-    EXPECT_EQ(_search_xmldb_id_entry(&id, "/l", 10, "name", "c"), ID_ENTRY_NOT_FOUND);
-    EXPECT_EQ(id, 0);
-    EXPECT_EQ(_cal_xmldb_id_entry_count("/l", 10, "name"), 1);
-    EXPECT_EQ(_get_free_xmldb_id_entry(&id, "/l", 10, "name"), ID_ENTRY_FOUND);
-    EXPECT_EQ(id, 2);
-
-    // Whole values only, and never past the limit.
-    put("/l/id:2/name", "abc");
-    EXPECT_EQ(_search_xmldb_id_entry(&id, "/l", 10, "name", "ab"), ID_ENTRY_NOT_FOUND);
-    EXPECT_EQ(_search_xmldb_id_entry(&id, "/l", 2, "name", "c"), ID_ENTRY_NOT_FOUND);
-    EXPECT_EQ(_search_xmldb_id_entry(&id, "/l", 3, "name", "c"), ID_ENTRY_FOUND);
-    EXPECT_EQ(_cal_xmldb_id_entry_count("/l", 2, "name"), 2);
-    EXPECT_EQ(_get_free_xmldb_id_entry(&id, "/l", 3, "name"), ID_ENTRY_NOT_FOUND);
-    EXPECT_EQ(quiet([&] { return _search_xmldb_id_entry(&id, nullptr, 10, "name", "a"); }), ERR_PARAM);
-}
-
-TEST_F(IdEntryScan, CountersNeverGoBelowZeroAndAclRecountStopsAtAGap)
-{
-    EXPECT_EQ(_xmldb_dec_target_count(), KORV_OK);
-    EXPECT_EQ(_xmldb_inc_target_count(), KORV_OK);
-    EXPECT_EQ(_xmldb_inc_target_count(), KORV_OK);
-    EXPECT_EQ(_xmldb_inc_target_lun_map_cnt(3), KORV_OK);
-    EXPECT_EQ(raw("/iscsi/target/count") + raw("/iscsi/target/id:3/map_lun/count"), "21");
-
-    put("/iscsi/acl/id:1/initiator", "iqn.a");
-    put("/iscsi/acl/id:2/initiator", "iqn.b");
-    put("/iscsi/acl/id:4/initiator", "iqn.d");
-    EXPECT_EQ(iscsi_conf_ops.xmldb_update_current_aclcnt(), KORV_OK);
-    EXPECT_EQ(raw("/iscsi/acl/count"), "2");
-}
-
 using TargetAdd = StoreTest;
 
 TEST_F(TargetAdd, WritesEveryFieldButCredentialsOnlyWithChapOn)
