@@ -27,19 +27,6 @@ const char *mapped_lun_root(char (&buf)[N], int acl)
     return sub_root(buf, kAcls.root, acl, "mapped_lun");
 }
 
-// Entry of value in a sub-list, or a free one when absent: >= 1, or a code.
-int find_or_free(const char *root, int max, const char *key, const char *value)
-{
-    int n = 0;
-    int rc = _search_xmldb_id_entry(&n, root, max, key, value);
-    if (rc == ID_ENTRY_FOUND)
-        return n;
-    if (rc != ID_ENTRY_NOT_FOUND)
-        return ERR_DB_WRITE;
-    rc = _get_free_xmldb_id_entry(&n, root, max, key);
-    return rc == ID_ENTRY_FOUND ? n : rc == ID_ENTRY_NOT_FOUND ? ERR_NO_ROOM : ERR_DB_WRITE;
-}
-
 // Writes one value, logged as the right-writing steps are.
 int set_logged(const char *func, const char *root, int n, const char *field, const char *value)
 {
@@ -155,26 +142,36 @@ int xmldb_check_add_acl_initiator(const char *initiator, const char *alias)
     return xmldb_check_acl_initiaor_exist(initiator) == 1 || xmldb_check_acl_alias_exist(alias) == 1 ? 1 : 0;
 }
 
-int xmldb_add_acl_initiator(const char *initiator, const char *alias)
+namespace {
+// Adds the initiator at the first free entry, *out its number.
+int add_initiator(const char *initiator, const char *alias, int *out)
 {
-    PARAM_GUARD(!initiator || !alias || !initiator[0] || !fits<CONF_IQN_LEN>(initiator));
-    int n = 0;
+    const char *func = "xmldb_add_acl_initiator";
+    int &n = *out;
     int rc = _get_free_xmldb_id_entry(&n, kAcls.root, kAcls.max, kAcls.key);
     if (rc == ID_ENTRY_NOT_FOUND) {
-        DBG(0, "the maximum number of targets has reached");
+        DBG_AS(func, 0, "the maximum number of targets has reached");
         return ERR_NO_ROOM;
     }
     if (rc != ID_ENTRY_FOUND) {
-        DBG(0, "conf error");
+        DBG_AS(func, 0, "conf error");
         return ERR_DB_WRITE;
     }
-    rc = write_fields(__func__, kAcls.root, n,
+    rc = write_fields(func, kAcls.root, n,
                       {{"initiator", initiator, 0, "set %s = %s failed"}, {"alias", alias, 0, "set %s = %s failed"}});
     if (rc != KORV_OK)
         return rc;
     if (_xmldb_inc_acl_count() != KORV_OK)
         return ERR_DB_WRITE;
     return _xmldb_update_current_acl_mapluncnt(n);
+}
+}  // namespace
+
+int xmldb_add_acl_initiator(const char *initiator, const char *alias)
+{
+    PARAM_GUARD(!initiator || !alias || !initiator[0] || !fits<CONF_IQN_LEN>(initiator));
+    int n = 0;
+    return add_initiator(initiator, alias, &n);
 }
 
 namespace {
@@ -232,12 +229,11 @@ int xmldb_set_lun_acl(const char *initiator, const char *alias, const char *lun_
         return lun == ERR_NOT_FOUND ? ERR_PARAM : lun;
     int acl = find_entry(__func__, kAcls, initiator, "can not find %s in xmldb acl entry", 2);
     if (acl == ERR_NOT_FOUND) {
-        int rc = xmldb_add_acl_initiator(initiator, alias);
+        int rc = add_initiator(initiator, alias, &acl);
         if (rc != KORV_OK) {
             DBG(0, "can not add new acl initiator");
             return rc;
         }
-        acl = find_entry(__func__, kAcls, initiator, "can not find %s in xmldb acl entry");
     }
     if (acl < 1) {
         DBG(0, "config fail");

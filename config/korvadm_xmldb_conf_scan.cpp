@@ -268,3 +268,16 @@ int xmldb_conf::remove_compact(const char *func, const char *root, int n, int ma
     }
     return KORV_OK;
 }
+
+int xmldb_conf::find_or_free(const char *root, int max, const char *key, const char *value)
+{
+    for (int n = 1; n <= max; n++) {
+        char got[kKeyLen];
+        int rc = KORV_OK;
+        if (!read_key(root, n, key, got, &rc))
+            return rc == KORV_OK ? n : rc;
+        if (strnlen(got, sizeof got) < sizeof got - 1 && std::strcmp(got, value) == 0)
+            return n;
+    }
+    return ERR_NO_ROOM;
+}

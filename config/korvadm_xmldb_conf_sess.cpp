@@ -10,15 +10,6 @@ using namespace xmldb_conf;
 
 namespace {
 
-// Entry of value in a list, or the next free one: >= 1, or -1 when neither.
-int find_or_next(const char *root, int max, const char *key, const char *value)
-{
-    int n = 0;
-    if (_search_xmldb_id_entry(&n, root, max, key, value) == ID_ENTRY_FOUND)
-        return n;
-    return _get_free_xmldb_id_entry(&n, root, max, key) == ID_ENTRY_FOUND ? n : -1;
-}
-
 int recount(const char *func, const char *root, int max, const char *key, const char *msg)
 {
     char path[kPathLen];
@@ -48,7 +39,7 @@ int xmldb_update_sess_acl_lun_access_status(const char *initiator, const char *l
     PARAM_GUARD(!initiator || !lun_name || !initiator[0] || !lun_name[0] || !fits<CONF_IQN_LEN>(initiator) ||
                    !fits<CONF_NAME_LEN>(lun_name));
     char path[kPathLen];
-    int s = find_or_next(kSessions.root, kSessions.max, kSessions.key, initiator);
+    int s = find_or_free(kSessions.root, kSessions.max, kSessions.key, initiator);
     if (s < 1) {
         DBG(0, "get free sess acl idx error");
         return -1;
@@ -61,7 +52,7 @@ int xmldb_update_sess_acl_lun_access_status(const char *initiator, const char *l
 
     char root[kPathLen];
     sub_root(root, kSessions.root, s, "access_lun");
-    int a = find_or_next(root, CONF_MAX_LUNS, "lun_name", lun_name);
+    int a = find_or_free(root, CONF_MAX_LUNS, "lun_name", lun_name);
     if (a < 1) {
         DBG(0, "get free acl_mapped_lun_idx error");
         return -1;
