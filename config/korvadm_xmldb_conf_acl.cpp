@@ -40,10 +40,12 @@ int set_logged(const char *func, const char *root, int n, const char *field, con
     return KORV_OK;
 }
 
-int recount(const char *func, const char *root, int max, const char *key, const char *msg)
+// known: the list's length when the caller has just seen it whole (it took
+// the first free entry), else -1 to count it.
+int recount(const char *func, const char *root, int max, const char *key, const char *msg, int known = -1)
 {
     char path[kPathLen];
-    int count = _cal_xmldb_id_entry_count(root, max, key);
+    int count = known >= 0 ? known : _cal_xmldb_id_entry_count(root, max, key);
     if (xmldb_set_int32_t(count, pathf(path, sizeof path, "%s/count", root)) != KORV_OK) {
         DBG_AS(func, 0, "xmldb_set_int32_t( %d, %s) failed", count, path);
         return ERR_DB_WRITE;
@@ -186,7 +188,8 @@ int write_right(const char *initiator, const char *alias, const char *lun_name, 
     }
     const char *word = kRightWords[right];
     char root[kPathLen];
-    int k = find_or_free(lun_acl_root(root, lun), CONF_MAX_ACLS, "initiator", initiator);
+    bool k_new = false, m_new = false;
+    int k = find_or_free(lun_acl_root(root, lun), CONF_MAX_ACLS, "initiator", initiator, &k_new);
     DBG_AS(func, 2, "get lun acl db idx = %d", k);
     if (k < 1) {
         DBG_AS(func, 0, "Error when get new lun acl dbidx for ACL initiator_name = %s", initiator);
@@ -197,7 +200,7 @@ int write_right(const char *initiator, const char *alias, const char *lun_name, 
         (rc = set_logged(func, root, k, "alias", alias)) != KORV_OK ||
         (rc = set_logged(func, root, k, "access_right", word)) != KORV_OK)
         return rc;
-    int m = find_or_free(mapped_lun_root(root, acl), CONF_MAX_LUNS, "lun_name", lun_name);
+    int m = find_or_free(mapped_lun_root(root, acl), CONF_MAX_LUNS, "lun_name", lun_name, &m_new);
     DBG_AS(func, 2, "get acl mapped lun db idx = %d", m);
     if (m < 1) {
         DBG_AS(func, 0, "Error when get new acl map lun dbidx for ACL initiator_name = %s", initiator);
@@ -206,7 +209,12 @@ int write_right(const char *initiator, const char *alias, const char *lun_name, 
     if ((rc = set_logged(func, root, m, "lun_name", lun_name)) != KORV_OK ||
         (rc = set_logged(func, root, m, "access_right", word)) != KORV_OK)
         return rc;
-    if (_xmldb_update_current_lun_aclcnt(lun) != KORV_OK || _xmldb_update_current_acl_mapluncnt(acl) != KORV_OK)
+    // A new entry took the first free number, so it is also the list's length.
+    char other[kPathLen];
+    if (recount("_xmldb_update_current_lun_aclcnt", lun_acl_root(other, lun), CONF_MAX_ACLS, "initiator",
+                "total lun acl's entry count =%d", k_new ? k : -1) != KORV_OK ||
+        recount("_xmldb_update_current_acl_mapluncnt", root, CONF_MAX_LUNS, "lun_name",
+                "total lun acl's entry count =%d", m_new ? m : -1) != KORV_OK)
         return ERR_DB_WRITE;
     return KORV_OK;
 }

@@ -182,9 +182,9 @@ int find_entry(const char *func, const Keyed &list, const char *value, const cha
 int find_target(const char *func, const char *name);
 
 // Entry of value in a dense list, or the first free one when it is absent,
-// in one pass: >= 1; -9979 when all max entries hold other keys; -9992 when
-// the service fails.
-int find_or_free(const char *root, int max, const char *key, const char *value);
+// in one pass: >= 1 (*is_new tells which, when given); -9979 when all max
+// entries hold other keys; -9992 when the service fails.
+int find_or_free(const char *root, int max, const char *key, const char *value, bool *is_new = nullptr);
 
 // Whether value is the key of an entry, scanning 1..max up to the first
 // empty key: 1 found; -9979 when all max entries hold other keys; else 0.

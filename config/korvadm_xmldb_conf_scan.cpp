@@ -269,13 +269,16 @@ int xmldb_conf::remove_compact(const char *func, const char *root, int n, int ma
     return KORV_OK;
 }
 
-int xmldb_conf::find_or_free(const char *root, int max, const char *key, const char *value)
+int xmldb_conf::find_or_free(const char *root, int max, const char *key, const char *value, bool *is_new)
 {
     for (int n = 1; n <= max; n++) {
         char got[kKeyLen];
         int rc = KORV_OK;
-        if (!read_key(root, n, key, got, &rc))
+        if (!read_key(root, n, key, got, &rc)) {
+            if (is_new)
+                *is_new = rc == KORV_OK;
             return rc == KORV_OK ? n : rc;
+        }
         if (strnlen(got, sizeof got) < sizeof got - 1 && std::strcmp(got, value) == 0)
             return n;
     }
