@@ -83,7 +83,7 @@ int set_total(const char *path, uint64_t size)
 
 int xmldb_get_vol_lun_info_idx_by_uuid(const char *uuid)
 {
-    PARAM_ERROR_IF(!uuid);
+    PARAM_GUARD(!uuid);
     char text[128] = "";
     if (xmldb_get_cstring(text, sizeof text, kVolCount) != KORV_OK && !text[0]) {
         DBG(0, "xmldb error at strNode: %s", kVolCount);
@@ -110,7 +110,7 @@ int xmldb_set_lun_total_apparent_size(uint64_t size) { return set_total(kTotalSi
 
 int xmldb_update_total_vol_size_info(list_t *volumes)
 {
-    PARAM_ERROR_IF(!volumes);
+    PARAM_GUARD(!volumes);
     for (vol_info_t *vol : korv::list_records<vol_info_t>(volumes))
         if (!vol->keep_figures)
             carry_over_old_summary(vol);
