@@ -3,11 +3,13 @@
 
 #include <cstdlib>
 #include <cstring>
+#include <string_view>
 
 #include "common/korvadm_err.h"
 #include "common/korvadm_log.h"
 #include "common/korvadm_str.h"
 #include "kernel/korvadm_mod_lio4.h"
+#include "kernel/korvadm_sess.h"
 
 const iscsi_mod_ops_t *iscsi_mod_ops = nullptr;
 
@@ -20,6 +22,7 @@ iscsi_target_t *iscsi_target_new(void)
         return nullptr;
     t->tpgt = -1;
     list_init(&t->ip_list);
+    list_init(&t->sess_list);
     list_node_init(&t->node, t);
     return t;
 }
@@ -28,9 +31,20 @@ void iscsi_target_free(iscsi_target_t *target)
 {
     if (!target)
         return;
+    iscsi_sess_detach_list(&target->sess_list);
     list_remove(&target->node);
     iscsi_ip_free_list(&target->ip_list);
     std::free(target);
+}
+
+int iscsi_target_cmp(const iscsi_target_t *lhs, const iscsi_target_t *rhs)
+{
+    if (!lhs || !rhs) {
+        DBG(0, "lhs or rhs is NULL");
+        return 0;
+    }
+    size_t n = strnlen(lhs->iqn, sizeof lhs->iqn);
+    return n > 0 && n == strnlen(rhs->iqn, sizeof rhs->iqn) && std::memcmp(lhs->iqn, rhs->iqn, n) == 0;
 }
 
 iscsi_lun_t *iscsi_lun_new(void)
@@ -75,12 +89,59 @@ void free_record(T *r)
 
 iscsi_initiator_t *iscsi_initiator_new(void)
 {
-    return new_record<iscsi_initiator_t>();
+    iscsi_initiator_t *i = new_record<iscsi_initiator_t>();
+    if (i)
+        list_init(&i->sess_list);
+    return i;
 }
 
 void iscsi_initiator_free(iscsi_initiator_t *initiator)
 {
+    if (initiator)
+        iscsi_sess_detach_list(&initiator->sess_list);
     free_record(initiator);
+}
+
+void iscsi_initiator_free_list(list_t *list)
+{
+    list_release(list, [](void *rec) { iscsi_initiator_free(static_cast<iscsi_initiator_t *>(rec)); });
+}
+
+int iscsi_initiator_cmp(const char *lhs, const char *rhs)
+{
+    return lhs && rhs && *lhs && std::strcmp(lhs, rhs) == 0;
+}
+
+iscsi_initiator_t *iscsi_initiator_list_search(list_t *list, const char *name)
+{
+    if (!list) {
+        DBG(0, "ERR_PARAM_ERROR");
+        return nullptr;
+    }
+    if (!name || !*name)
+        return nullptr;
+    std::string_view want(name);
+    // The record's name is read within its field, terminated or not.
+    return korv::list_find<iscsi_initiator_t>(list, [want](const iscsi_initiator_t *i) {
+        return std::string_view(i->name, strnlen(i->name, sizeof i->name)) == want;
+    });
+}
+
+iscsi_initiator_t *iscsi_initiator_list_add(list_t *list, const char *name)
+{
+    if (!list || !name || !*name)
+        return nullptr;
+    if (iscsi_initiator_t *found = iscsi_initiator_list_search(list, name))
+        return found;
+    iscsi_initiator_t *i = iscsi_initiator_new();
+    if (!i)
+        return nullptr;
+    if (!korv::copy_bounded(i->name, name)) {
+        iscsi_initiator_free(i);  // a name cut short would be another initiator
+        return nullptr;
+    }
+    list_append(&i->node, list);
+    return i;
 }
 
 iscsi_map_lun_t *iscsi_map_lun_new(void)

@@ -40,6 +40,7 @@ typedef struct iscsi_target_s {
     char mutual_user[ISCSI_NAME_LEN];
     char mutual_pass[ISCSI_NAME_LEN];
     list_t ip_list;                       /* wanted portals, iscsi_ip_t */
+    list_t sess_list;                     /* its sessions, iscsi_sess_t (not owned) */
     list_node_t node;                     /* owner is the target */
 } iscsi_target_t;
 
@@ -57,6 +58,7 @@ typedef struct iscsi_lun_s {
 /* An initiator named by an ACL. */
 typedef struct iscsi_initiator_s {
     char name[ISCSI_INITIATOR_LEN];
+    list_t sess_list;                     /* its sessions, iscsi_sess_t (not owned) */
     list_node_t node;
 } iscsi_initiator_t;
 
@@ -81,8 +83,12 @@ typedef struct iscsi_lun_acl_s {
 /* Zeroed record: iqn/alias "", tpgt -1, CHAP off, empty portal list.
  * NULL when memory is short. */
 iscsi_target_t *iscsi_target_new(void);
-/* Unlinks the record, frees its portal list and itself; NULL is ignored. */
+/* Detaches its sessions (korvadm_sess.h), unlinks the record, frees its
+ * portal list and itself; NULL is ignored. */
 void iscsi_target_free(iscsi_target_t *target);
+/* 1 when both targets are given and carry the same non-empty IQN, else 0
+ * (a missing one logs "lhs or rhs is NULL"). */
+int iscsi_target_cmp(const iscsi_target_t *lhs, const iscsi_target_t *rhs);
 /* Zeroed record: lun_num -1, hba_id -1. NULL when memory is short. */
 iscsi_lun_t *iscsi_lun_new(void);
 /* Unlinks and frees; NULL is ignored. */
@@ -91,11 +97,20 @@ void iscsi_lun_free(iscsi_lun_t *lun);
  * references); NULL when memory is short. Each free unlinks the record and
  * frees it alone, never what it refers to; NULL is ignored. */
 iscsi_initiator_t *iscsi_initiator_new(void);
-void iscsi_initiator_free(iscsi_initiator_t *initiator);
+void iscsi_initiator_free(iscsi_initiator_t *initiator);  /* detaches its sessions first */
 iscsi_map_lun_t *iscsi_map_lun_new(void);
 void iscsi_map_lun_free(iscsi_map_lun_t *map_lun);
 iscsi_lun_acl_t *iscsi_lun_acl_new(void);
 void iscsi_lun_acl_free(iscsi_lun_acl_t *lun_acl);
+
+/* Initiator lists, by exact name: free a whole list; 1 when both names are
+ * non-empty and byte for byte equal, else 0; the listed initiator of that
+ * name or NULL; that one, else a new one appended (NULL for a missing list,
+ * an empty name or one that does not fit, or no memory). */
+void iscsi_initiator_free_list(list_t *list);
+int iscsi_initiator_cmp(const char *lhs, const char *rhs);
+iscsi_initiator_t *iscsi_initiator_list_search(list_t *list, const char *name);
+iscsi_initiator_t *iscsi_initiator_list_add(list_t *list, const char *name);
 
 /* The operations table: 22 slots in this fixed order. */
 typedef struct iscsi_mod_ops_s {

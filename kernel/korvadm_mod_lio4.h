@@ -168,6 +168,16 @@ int lio3_add_lun_acl(iscsi_lun_acl_t *lun_acl);
 int lio3_del_lun_acl(iscsi_lun_acl_t *lun_acl);
 
 
+/* ---- sessions (slot 21; records in kernel/korvadm_sess.h) ---- */
+
+/* Appends the portal group's live sessions to sess_list and links each into
+ * its target's and initiator's session lists; initiators are found in, or
+ * added to, initiator_list by name. The kernel's text comes from the group's
+ * "sessions" file or, on kernels without one, from every ACL's "info" file
+ * (32768 bytes at most in all). Neither present: 0, nothing added. -9989 bad
+ * arguments; -9987 no memory; -9973 the text cannot be read. */
+int lio3_get_target_session(list_t *sess_list, list_t *initiator_list, iscsi_target_t *target);
+
 #ifdef __cplusplus
 }
 #endif

@@ -11,6 +11,7 @@
 
 #include <dirent.h>
 
+#include <cstdint>
 #include <cstring>
 #include <memory>
 #include <string>
@@ -248,6 +249,25 @@ int _lio3_del_acl_initiator(const char *initiator_name, iscsi_target_t *target);
 int _lio3_set_lun_acl_read_only(iscsi_lun_acl_t *lun_acl);
 int _lio3_set_lun_acl_read_write(iscsi_lun_acl_t *lun_acl);
 int _lio3_set_lun_acl_deny(iscsi_lun_acl_t *lun_acl);
+
+/* korvadm_mod_lio4_sessions.cpp */
+
+/* Parses len bytes of the kernel's sessions text (not necessarily
+ * terminated) into sessions; single bad lines are logged and skipped. 0, or
+ * -9989 for a NULL list, target or buffer. */
+int _lio3_parse_sessions(list_t *sess_list, list_t *initiator_list, iscsi_target_t *target, const char *buf,
+                         size_t len);
+/* Copies the line at pos (up to the next newline before end, cut to max
+ * characters) into line_out (max+1 bytes, terminated); *next_out is set past
+ * the newline. No newline left: 0 and *next_out NULL. Returns the length. */
+size_t _lio3_get_session_line(char *line_out, size_t max, const char *pos, const char *end, const char **next_out);
+/* The line parsers: 0, or -1 when the line lacks its number (a bad ISID or
+ * TSIH does not fail the session line; the TSIH is then -1). */
+int _parse_LIO3_SID_line(const char *line, uint64_t *sid, int32_t *tsih, uint8_t isid[6]);
+int _parse_LIO3_sess_CID_line(const char *line, int *cid);
+/* Copies the address after "Address " up to the next blank, cut to 31
+ * characters, into out (32 bytes). */
+int _parse_LIO3_sess_ADDR_line(const char *line, char out[32]);
 }
 
 #endif

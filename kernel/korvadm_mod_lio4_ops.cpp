@@ -25,7 +25,7 @@ const iscsi_mod_ops_t lio3_mod_ops = {
     .del_acl_initiator = lio3_del_acl_initiator,
     .add_lun_acl = lio3_add_lun_acl,
     .del_lun_acl = lio3_del_lun_acl,
-    .get_target_session = nullptr,
+    .get_target_session = lio3_get_target_session,                           // _sessions.cpp
 };
 
 // The slot numbers are the table's contract: a field moved in the struct
