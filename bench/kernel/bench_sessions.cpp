@@ -10,7 +10,7 @@
 #include <string>
 #include <vector>
 
-#include "kernel/korvadm_mod_lio4.h"
+#include "kernel/korvadm_mod_lio4_internal.h"
 #include "kernel/korvadm_sess.h"
 
 namespace {

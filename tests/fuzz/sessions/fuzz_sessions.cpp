@@ -10,7 +10,7 @@
 #include <memory>
 
 #include "common/korvadm_log.h"
-#include "kernel/korvadm_mod_lio4.h"
+#include "kernel/korvadm_mod_lio4_internal.h"
 #include "kernel/korvadm_sess.h"
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size)
