@@ -384,8 +384,11 @@ int _lio3_parse_sessions(list_t *sess_list, list_t *initiator_list, iscsi_target
 
 namespace {
 
-// Stock kernels: the ACLs' "info" texts, one after another, cut when the
-// buffer is full. -9973 when one that exists cannot be read.
+// Stock kernels: the ACLs' "info" texts with a session, one after another,
+// cut when the buffer is full. An idle ACL's text ("No active iSCSI Session
+// for Initiator Endpoint: ...") is left out: between a session's last
+// address and the next initiator it would keep that session from closing.
+// -9973 when one that exists cannot be read.
 int read_acl_infos(const std::string &acls, const std::vector<std::string> &names, char *buf, size_t &used)
 {
     used = 0;
@@ -400,6 +403,8 @@ int read_acl_infos(const std::string &acls, const std::vector<std::string> &name
             DBG_AS("lio3_get_target_session", 0, "read path %s failed", info.c_str());
             return ERR_CONFIGFS;
         }
+        if (std::string_view(buf + used, n).find(KEY_INITIATOR) == std::string_view::npos)
+            continue;
         used += n;
         // Keep the next text's first line a line of its own.
         if (n > 0 && buf[used - 1] != '\n' && used < SESSIONS_BUF_SIZE)

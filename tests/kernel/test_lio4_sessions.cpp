@@ -182,7 +182,9 @@ TEST_F(LioSessionsRead, SessionsFileFirstThenEveryAclInfoThenNothing)
     }
     write_file(tpg() + "/acls/iqn.2026-01.test:c/info", block("iqn.2026-01.test:c", 3, "10.0.0.3"));
     write_file(tpg() + "/acls/iqn.2026-01.test:a/info", block("iqn.2026-01.test:a", 1, "::1"));
+    // Idle ACLs between and after the active ones: the last session still closes.
     write_file(tpg() + "/acls/iqn.2026-01.test:b/info", idle("iqn.2026-01.test:b"));
+    write_file(tpg() + "/acls/iqn.2026-01.test:d/info", idle("iqn.2026-01.test:d"));
     mkdirs(tpg() + "/acls/iqn.2026-01.test:gone");  // no info file
     {
         Listing l;
