@@ -27,6 +27,7 @@
 #include <vector>
 
 #include "common/korvadm_err.h"
+#include "common/korvadm_str.h"
 #include "kernel/korvadm_sess.h"
 
 namespace {
@@ -150,9 +151,7 @@ struct session_parser {
         std::string_view name;
         after(line, KEY_INITIATOR, name);
         char copy[INITIATOR_NAME_MAX + 1];
-        size_t n = std::min(name.size(), INITIATOR_NAME_MAX);
-        name.copy(copy, n);
-        copy[n] = '\0';
+        korv::copy_bounded(copy, name.data());  // the rest of a terminated line
         DBG(1, "get initiator name = |%s|", copy);
         initiator = iscsi_initiator_list_search(initiators, copy);
         if (!initiator)
@@ -260,10 +259,6 @@ struct session_parser {
     }
 };
 
-struct free_deleter {
-    void operator()(void *p) const { std::free(p); }
-};
-
 }  // namespace
 
 size_t _lio3_get_session_line(char *line_out, size_t max, const char *pos, const char *end, const char **next_out)
@@ -287,10 +282,7 @@ size_t _lio3_get_session_line(char *line_out, size_t max, const char *pos, const
 
 int _parse_LIO3_SID_line(const char *line, uint64_t *sid, int32_t *tsih, uint8_t isid[6])
 {
-    if (!line || !sid || !tsih || !isid) {
-        DBG(0, "ERR_PARAM_ERROR");
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(!line || !sid || !tsih || !isid, "ERR_PARAM_ERROR");
     std::string_view text(line), rest;
     if (!after(text, KEY_SID, rest) || !read_number(rest, 10, *sid)) {
         DBG(0, "get sid failed, exit");
@@ -318,10 +310,7 @@ int _parse_LIO3_SID_line(const char *line, uint64_t *sid, int32_t *tsih, uint8_t
 
 int _parse_LIO3_sess_CID_line(const char *line, int *cid)
 {
-    if (!line || !cid) {
-        DBG(0, "ERR_PARAM_ERROR");
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(!line || !cid, "ERR_PARAM_ERROR");
     std::string_view rest;
     if (!after(line, KEY_CID, rest) || !read_number(rest, 10, *cid)) {
         DBG(0, "get CID failed");
@@ -334,10 +323,7 @@ int _parse_LIO3_sess_CID_line(const char *line, int *cid)
 
 int _parse_LIO3_sess_ADDR_line(const char *line, char out[32])
 {
-    if (!line || !out) {
-        DBG(0, "ERR_PARAM_ERROR");
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(!line || !out, "ERR_PARAM_ERROR");
     std::string_view rest;
     if (!after(line, KEY_ADDRESS, rest)) {
         DBG(0, "get Address failed");
@@ -353,10 +339,7 @@ int _parse_LIO3_sess_ADDR_line(const char *line, char out[32])
 int _lio3_parse_sessions(list_t *sess_list, list_t *initiator_list, iscsi_target_t *target, const char *buf,
                          size_t len)
 {
-    if (!sess_list || !initiator_list || !target || !buf) {
-        DBG(0, "ERR_PARAM_ERROR");
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(!sess_list || !initiator_list || !target || !buf, "ERR_PARAM_ERROR");
     if (len == 0)
         return KORV_OK;
     const char *end = buf + len;
@@ -417,10 +400,7 @@ int read_acl_infos(const std::string &acls, const std::vector<std::string> &name
 
 int lio3_get_target_session(list_t *sess_list, list_t *initiator_list, iscsi_target_t *target)
 {
-    if (!sess_list || !initiator_list) {
-        DBG(0, "ERR_PARAM_ERROR");
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(!sess_list || !initiator_list, "ERR_PARAM_ERROR");
     CHECK_TARGET(target, "ERR_PARAM_ERROR", "target iqn is empty", "target tpgt is wrong: %d", target->tpgt);
     std::string tpg = lio4::tpg_dir(target->iqn, target->tpgt);
     std::string sessions = tpg + "/sessions";
@@ -432,7 +412,7 @@ int lio3_get_target_session(list_t *sess_list, list_t *initiator_list, iscsi_tar
         return KORV_OK;
     }
     std::sort(names.begin(), names.end());
-    std::unique_ptr<char, free_deleter> buf(static_cast<char *>(std::calloc(1, SESSIONS_BUF_SIZE)));
+    korv::c_buffer buf(static_cast<char *>(std::calloc(1, SESSIONS_BUF_SIZE)));
     if (!buf) {
         DBG(0, "malloc size = %d failed", static_cast<int>(SESSIONS_BUF_SIZE));
         return ERR_NO_MEMORY;

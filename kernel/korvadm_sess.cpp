@@ -80,10 +80,7 @@ void iscsi_sess_detach_list(list_t *list)
 
 int _iscsi_sess_cmp(const iscsi_sess_t *lhs, const iscsi_sess_t *rhs)
 {
-    if (!lhs || !rhs) {
-        DBG(0, "ERR_PARAM_ERROR");
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(!lhs || !rhs, "ERR_PARAM_ERROR");
     if (lhs->sid != rhs->sid || !lhs->target || !rhs->target || !iscsi_target_cmp(lhs->target, rhs->target))
         return 0;
     const iscsi_initiator_t *a = lhs->initiator, *b = rhs->initiator;
@@ -145,10 +142,7 @@ iscsi_sess_t *iscsi_sess_list_add(list_t *list, uint64_t sid, const uint8_t isid
 
 int iscsi_sess_list_add_node(list_t *list, iscsi_sess_t *sess)
 {
-    if (!list || !sess) {
-        DBG(0, "ERR_PARAM_ERROR");
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(!list || !sess, "ERR_PARAM_ERROR");
     return korv::list_add_unique(list, sess, &sess->node,
                                  [](const iscsi_sess_t *a, const iscsi_sess_t *b) { return _iscsi_sess_cmp(a, b) == 1; });
 }
@@ -185,10 +179,7 @@ void iscsi_conn_free(iscsi_conn_t *conn)
 
 int _iscsi_conn_cmp(const iscsi_conn_t *lhs, const iscsi_conn_t *rhs)
 {
-    if (!lhs || !rhs) {
-        DBG(0, "ERR_PARAM_ERROR");
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(!lhs || !rhs, "ERR_PARAM_ERROR");
     return lhs->cid >= 0 && lhs->cid == rhs->cid && text_of(lhs->address) == text_of(rhs->address);
 }
 
@@ -249,10 +240,7 @@ iscsi_conn_t *iscsi_conn_list_add(list_t *list, int cid, const char *local, cons
 
 int iscsi_conn_list_add_node(list_t *list, iscsi_conn_t *conn)
 {
-    if (!list || !conn) {
-        DBG(0, "ERR_PARAM_ERROR");
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(!list || !conn, "ERR_PARAM_ERROR");
     return korv::list_add_unique(list, conn, &conn->node,
                                  [](const iscsi_conn_t *a, const iscsi_conn_t *b) { return _iscsi_conn_cmp(a, b) == 1; });
 }
