@@ -62,10 +62,10 @@ struct Listing {
     {
         std::ostringstream out;
         for (iscsi_sess_t *s : korv::list_records<iscsi_sess_t>(&sessions)) {
-            char isid[3 * ISCSI_ISID_LEN];
+            char isid[3 * ISCSI_ISID_LEN + 1];
             for (int i = 0; i < ISCSI_ISID_LEN; ++i)
                 std::snprintf(isid + 3 * i, 4, "%02x ", s->isid[i]);
-            isid[3 * ISCSI_ISID_LEN - 1] = '\0';
+            isid[3 * ISCSI_ISID_LEN - 1] = '\0';  // no blank after the last
             bool to_target = s->target_node.list == &target->sess_list;
             bool to_initiator = s->initiator && s->initiator_node.list == &s->initiator->sess_list;
             out << "sess sid=" << s->sid << " tsih=" << s->tsih << " isid=" << isid
