@@ -1,12 +1,12 @@
 // The session listing against the real kernel target, inside the test VM
 // (tests/vm/lio_sessions.sh runs this binary there). A target built by the
 // driver, a real initiator (libiscsi's iscsi-perf, copied in when the host
-// has it) logged in over IPv4 and IPv6: the listing shows that session as
-// the kernel's own text has it, and nothing once the initiator has gone.
+// has it) logged in over IPv4 and IPv6 to a LUN and ACL the driver made:
+// the listing shows that session as the kernel's own text has it, and
+// nothing once the initiator has gone.
 // Debian's kernel has no "sessions" file, so this is the ACL "info" path.
 #include <fcntl.h>
 #include <signal.h>
-#include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -29,18 +29,11 @@ namespace {
 
 const char *const kPerf = "/usr/bin/iscsi-perf";
 const std::string kInitiator = "iqn.2026-01.vm:sess-init";
-const std::string kCore = "/sys/kernel/config/target/core/fileio_0/sessdisk";
 
 std::string slurp(const std::string &path)
 {
     std::ifstream in(path);
     return std::string(std::istreambuf_iterator<char>(in), {});
-}
-
-int poke(const std::string &path, const std::string &value)
-{
-    std::ofstream out(path);
-    return (out << value << std::flush) ? 0 : -1;
 }
 
 // One call of the listing, with its lists.
@@ -134,19 +127,31 @@ protected:
         ASSERT_EQ(iscsi_mod_set_target_ip(t_.get()), 0);
         ASSERT_EQ(iscsi_mod_set_target_chap(t_.get()), 0);  // CHAP off
         tpg_ = std::string("/sys/kernel/config/target/iscsi/") + t_->iqn + "/tpgt_1";
-        // A 1 MiB file as LUN 0, and the initiator's ACL with it mapped.
-        ASSERT_EQ(mkdir("/sys/kernel/config/target/core/fileio_0", 0700), 0);
-        ASSERT_EQ(mkdir(kCore.c_str(), 0700), 0);
-        ASSERT_EQ(poke(kCore + "/control", "fd_dev_name=/tmp/sessdisk.img,fd_dev_size=1048576"), 0);
-        ASSERT_EQ(poke(kCore + "/enable", "1"), 0);
-        ASSERT_EQ(mkdir((tpg_ + "/lun/lun_0").c_str(), 0700), 0);
-        ASSERT_EQ(symlink(kCore.c_str(), (tpg_ + "/lun/lun_0/sessdisk").c_str()), 0);
         acl_ = tpg_ + "/acls/" + kInitiator;
-        ASSERT_EQ(mkdir(acl_.c_str(), 0700), 0);
-        ASSERT_EQ(mkdir((acl_ + "/lun_0").c_str(), 0700), 0);
-        ASSERT_EQ(symlink((tpg_ + "/lun/lun_0").c_str(), (acl_ + "/lun_0/lun_0").c_str()), 0);
-        // An ACL no one logs in with, whose text comes after the session's.
-        ASSERT_EQ(mkdir((tpg_ + "/acls/iqn.2026-01.vm:v-idle").c_str(), 0700), 0);
+        // A 1 MiB file as LUN 0, read-write for the initiator; and an ACL no
+        // one logs in with, whose text comes after the session's.
+        lun_ = iscsi_lun_new();
+        ASSERT_NE(lun_, nullptr);
+        std::strcpy(lun_->name, "sessdisk");
+        std::strcpy(lun_->path, "/tmp/sessdisk.img");
+        std::strcpy(lun_->serial, "sess0001");
+        lun_->size = 1 << 20;
+        lun_->hba_id = 0;
+        ASSERT_EQ(iscsi_mod_add_backstore(lun_), 0);
+        ASSERT_EQ(iscsi_mod_add_lun_mapping(lun_, t_.get(), 0), 0);
+        ASSERT_EQ(iscsi_mod_add_acl_initiator(kInitiator.c_str(), t_.get()), 0);
+        ASSERT_EQ(iscsi_mod_add_acl_initiator("iqn.2026-01.vm:v-idle", t_.get()), 0);
+        iscsi_map_lun_t map{};
+        map.target = t_.get();
+        map.lun = lun_;
+        map.lun_num = 0;
+        iscsi_initiator_t init{};
+        std::strcpy(init.name, kInitiator.c_str());
+        iscsi_lun_acl_t acl{};
+        acl.map_lun = &map;
+        acl.initiator = &init;
+        acl.access_right = 2;
+        ASSERT_EQ(iscsi_mod_add_lun_acl(&acl), 0);
         ASSERT_EQ(iscsi_mod_enable_target(t_.get()), 0);
     }
     void TearDown() override
@@ -154,12 +159,15 @@ protected:
         if (!t_)
             return;
         EXPECT_EQ(iscsi_mod_del_target(t_.get()), 0);
-        EXPECT_EQ(rmdir(kCore.c_str()), 0);
-        EXPECT_EQ(rmdir("/sys/kernel/config/target/core/fileio_0"), 0);
+        if (lun_) {
+            EXPECT_EQ(iscsi_mod_del_backstore(lun_), 0);
+            iscsi_lun_free(lun_);
+        }
         EXPECT_EQ(iscsi_mod_stop(), 0);
     }
 
     vm::Target t_;
+    iscsi_lun_t *lun_ = nullptr;
     std::string tpg_, acl_;
 };
 
