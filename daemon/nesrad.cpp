@@ -2,9 +2,11 @@
 #include "daemon/nesrad.h"
 
 #include <arpa/inet.h>
+#include <fcntl.h>
 #include <netdb.h>
 #include <poll.h>
 #include <signal.h>
+#include <sys/file.h>
 #include <sys/socket.h>
 #include <time.h>
 #include <unistd.h>
@@ -23,6 +25,7 @@
 #include "common/korvadm_log.h"
 #include "common/korvadm_str.h"
 #include "common/korvadm_sys.h"
+#include "common/korvadm_sysroot.h"
 #include "common/korvadm_utils.h"
 #include "isns/isns_transport.h"
 #include "kernel/korvadm_mod.h"
@@ -30,6 +33,10 @@
 namespace {
 
 constexpr size_t kMaxHostArg = 255;
+constexpr const char *kLockFile = "/var/run/nesrad.lock";
+constexpr int kLockWaitMs = 20000;     // an old daemon still deregistering
+constexpr int kConfigRetryMs = 10000;  // a configuration service restarting
+constexpr unsigned kMinCheckMs = 5000;
 
 // Process-wide state of the daemon (one instance).
 char g_server_host[256];
@@ -37,6 +44,27 @@ volatile sig_atomic_t g_pending_event = -1;  // last signal received, -1: none
 unsigned g_poll_interval = NESRAD_POLL_INTERVAL;
 int g_registered;
 nesrad_node_t *g_iqn_head;
+int g_read_rc;  // result of the last read of the targets
+// Our signals are blocked outside the waits; g_open_mask lets them in.
+bool g_signals_ready;
+sigset_t g_open_mask;
+
+bool is_stop(int sig)
+{
+    return sig == SIGTERM || sig == SIGINT;
+}
+
+// Lets held signals in for a moment. True when a stop is pending: a pass
+// looks between its exchanges, so that a stop waits for one exchange at most.
+bool stop_pending()
+{
+    if (g_signals_ready) {
+        sigset_t held;
+        sigprocmask(SIG_SETMASK, &g_open_mask, &held);
+        sigprocmask(SIG_SETMASK, &held, nullptr);
+    }
+    return is_stop(g_pending_event);
+}
 
 using korv::copy_bounded;
 
@@ -142,8 +170,9 @@ int init_iqn_list(void)
     korv::list_owner targets(target_conf_free_list);
 
     const iscsi_conf_ops_t *ops = g_nesrad_conf.ops;
-    if (!ops || !ops->xmldb_get_all_target_conf_lite ||
-        ops->xmldb_get_all_target_conf_lite(targets.get()) != 0) {
+    g_read_rc = ops && ops->xmldb_get_all_target_conf_lite ? ops->xmldb_get_all_target_conf_lite(targets.get())
+                                                           : ERR_PARAM;
+    if (g_read_rc != 0) {
         DBG(0, "get target conf from config failed");
         return -1;
     }
@@ -274,7 +303,7 @@ int target_register_iSNS_all(void)
         return -1;
     }
     target_register_entity_identifier(rec->iqn, rec->tpgt);
-    for (rec = rec->next; rec; rec = rec->next)
+    for (rec = rec->next; rec && !stop_pending(); rec = rec->next)
         target_register_iSNS_single(rec->iqn, rec->tpgt);
     return 0;
 }
@@ -300,41 +329,88 @@ int write_pid(int on)
     return rc;
 }
 
-namespace {
-
-constexpr int kOurSignals[] = {SIGUSR1, SIGUSR2, SIGTERM};
-
-void on_signal(int sig)
+unsigned nesrad_check_interval_ms(unsigned poll_interval, unsigned period)
 {
-    g_pending_event = sig;
+    const unsigned long long poll_ms = poll_interval * 1000ULL;
+    if (period == 0 || period * 1000ULL >= 2 * poll_ms)
+        return static_cast<unsigned>(poll_ms);
+    return std::max(kMinCheckMs, static_cast<unsigned>(period * 2000ULL / 3));
 }
 
-timespec mono_now()
+namespace {
+
+constexpr int kOurSignals[] = {SIGUSR1, SIGUSR2, SIGTERM, SIGINT};
+
+// Handlers never nest (each blocks the others), and a pending stop is never
+// replaced by a reload.
+void on_signal(int sig)
+{
+    if (!is_stop(g_pending_event))
+        g_pending_event = sig;
+}
+
+long long mono_ms()
 {
     timespec ts{};
     clock_gettime(CLOCK_MONOTONIC, &ts);
-    return ts;
+    return ts.tv_sec * 1000LL + ts.tv_nsec / 1000000;
 }
 
-// Waits one poll interval with our signals open. Returns false as soon as
-// one of them arrives. Outside this wait they stay blocked, so a signal sent
-// during an exchange is held and delivered here at once, never lost.
-bool wait_interval(const sigset_t *open_mask)
+// Waits with our signals open. Returns false as soon as an event is pending.
+// Outside the waits they stay blocked, so a signal sent during an exchange is
+// held and delivered at the next look, never lost.
+bool wait_ms(long long ms)
 {
-    timespec deadline = mono_now();
-    deadline.tv_sec += g_poll_interval;
+    const long long end = mono_ms() + ms;
     while (g_pending_event == -1) {
-        timespec now = mono_now();
-        timespec left{deadline.tv_sec - now.tv_sec, deadline.tv_nsec - now.tv_nsec};
-        if (left.tv_nsec < 0) {
-            left.tv_nsec += 1000000000L;
-            --left.tv_sec;
-        }
-        if (left.tv_sec < 0)
+        const long long left = end - mono_ms();
+        if (left <= 0)
             return true;
-        ppoll(nullptr, 0, &left, open_mask);
+        const timespec ts{static_cast<time_t>(left / 1000), static_cast<long>(left % 1000) * 1000000L};
+        ppoll(nullptr, 0, &ts, &g_open_mask);
     }
     return false;
+}
+
+// At exit: 0 goes only over our own pid, never over a successor's.
+void clear_pid()
+{
+    const iscsi_conf_ops_t *ops = g_nesrad_conf.ops;
+    int stored = 0;
+    if (ops && ops->xmldb_get_nesrad_pid && ops->xmldb_get_nesrad_pid(&stored) == 0 &&
+        stored == static_cast<int>(getpid()))
+        write_pid(0);
+}
+
+// One daemon per system root. A restarted daemon waits here while the old one
+// deregisters, so that it registers and stores its pid only after it. 0, or
+// the exit status 1. The descriptor stays open: the lock lasts until exit.
+int take_lock()
+{
+    const std::string path = sysroot_path(kLockFile);
+    const int fd = open(path.c_str(), O_RDWR | O_CREAT | O_NOFOLLOW | O_CLOEXEC, 0644);
+    if (fd < 0) {
+        // Better unguarded than no registration at all.
+        DBG(0, "cannot open %s: %s", path.c_str(), std::strerror(errno));
+        return 0;
+    }
+    const long long end = mono_ms() + kLockWaitMs;
+    for (bool said = false; flock(fd, LOCK_EX | LOCK_NB) != 0;) {
+        if (errno != EWOULDBLOCK && errno != EINTR) {
+            DBG(0, "cannot lock %s: %s", path.c_str(), std::strerror(errno));
+            return 0;
+        }
+        if (mono_ms() >= end) {
+            std::puts("another nesrad is running");
+            close(fd);
+            return 1;
+        }
+        if (!said)
+            DBG(1, "waiting for the running nesrad to stop");
+        said = true;
+        usleep(100000);
+    }
+    return 0;
 }
 
 // Resolves the server once into the transport's address globals.
@@ -395,30 +471,47 @@ int resolve_server(const char *host)
     return 0;
 }
 
+// Reads the targets. A configuration service that does not answer (a client
+// failure, not a bad record) is asked again once a second for up to 10 s; a
+// stop ends the waiting, a reload is what the next read does anyway.
+int load_targets()
+{
+    const long long end = mono_ms() + kConfigRetryMs;
+    int count;
+    while ((count = init_iqn_list()) < 0 && g_read_rc == ERR_DB_CLIENT && mono_ms() < end &&
+           !is_stop(g_pending_event)) {
+        _iqn_clear();
+        DBG(0, "configuration service not answering, reading again");
+        wait_ms(1000);
+        if (!is_stop(g_pending_event))
+            g_pending_event = -1;
+    }
+    return count;
+}
+
 enum class wake { reload, stop };
 
 // The waiting states (Registered, Unregistered, Idle) of one pass: signal
 // checks, one interval, then exactly one server check. Returns how the pass
 // ends.
-wake wait_for_event(int count, const sigset_t *open_mask)
+wake wait_for_event(int count)
 {
+    // A registration period shorter than two intervals is beaten by checking
+    // more often: a query from the entity's node refreshes it on the server.
+    const unsigned interval_ms = nesrad_check_interval_ms(g_poll_interval, isns_registration_period);
     for (;;) {
-        switch (g_pending_event) {
-        case SIGUSR1:
-        case SIGUSR2:
-            DBG(1, "Received event %s(%d)", g_pending_event == SIGUSR1 ? "SIGUSR1" : "SIGUSR2",
-                static_cast<int>(g_pending_event));
+        const int ev = g_pending_event;
+        if (ev == SIGUSR1 || ev == SIGUSR2) {
+            DBG(1, "Received event %s(%d)", ev == SIGUSR1 ? "SIGUSR1" : "SIGUSR2", ev);
             g_pending_event = -1;
             g_registered = 0;
             return wake::reload;
-        case SIGTERM:
-            DBG(1, "Received event SIGTERM(%d)", SIGTERM);
-            g_pending_event = -1;
-            return wake::stop;
-        default:
-            break;
         }
-        if (!wait_interval(open_mask) || count <= 0)
+        if (is_stop(ev)) {
+            DBG(1, "Received event %s(%d)", ev == SIGINT ? "SIGINT" : "SIGTERM", ev);
+            return wake::stop;
+        }
+        if (!wait_ms(interval_ms) || count <= 0)
             continue;
 
         int r = isns_check_registration(isns_entity_name);
@@ -439,11 +532,28 @@ wake wait_for_event(int count, const sigset_t *open_mask)
     }
 }
 
+constexpr const char kUsage[] =
+    "usage: nesrad <server>\n"
+    "Keeps this appliance's iSCSI targets registered with the iSNS server\n"
+    "<server> (host name or IPv4/IPv6 address; TCP port 3205). Targets and\n"
+    "settings come from the configuration database.\n"
+    "SIGUSR1, SIGUSR2: read the targets again and register them again.\n"
+    "SIGTERM, SIGINT: deregister and exit.";
+
 }  // namespace
 
 int nesrad_main(int argc, char **argv, unsigned poll_interval)
 {
     const char *arg = argc > 1 ? argv[1] : nullptr;
+    // Host names never start with '-': no server is lost to these two.
+    if (arg && std::strcmp(arg, "--help") == 0) {
+        std::puts(kUsage);
+        return 0;
+    }
+    if (arg && std::strcmp(arg, "--version") == 0) {
+        std::puts("nesrad " NESRAD_VERSION);
+        return 0;
+    }
     if (!arg || !arg[0]) {
         std::puts("isns host address not given");
         return 1;
@@ -468,30 +578,30 @@ int nesrad_main(int argc, char **argv, unsigned poll_interval)
     iscsi_mod_select(2);
 
     copy_bounded(g_server_host, sizeof g_server_host, arg);
-    if (resolve_server(g_server_host) != 0)
+    if (resolve_server(g_server_host) != 0 || take_lock() != 0)
         return 1;
 
     // Block our signals before the handler exists and before the pid is
     // published: the management tool may signal as soon as it reads the pid.
-    sigset_t ours, old_mask;
+    sigset_t ours;
     sigemptyset(&ours);
     for (int sig : kOurSignals)
         sigaddset(&ours, sig);
-    sigprocmask(SIG_BLOCK, &ours, &old_mask);
-    sigset_t open_mask = old_mask;
+    sigprocmask(SIG_BLOCK, &ours, &g_open_mask);
     struct sigaction sa{};
     sa.sa_handler = on_signal;
-    sigemptyset(&sa.sa_mask);
+    sa.sa_mask = ours;
     for (int sig : kOurSignals) {
-        sigdelset(&open_mask, sig);
+        sigdelset(&g_open_mask, sig);
         sigaction(sig, &sa, nullptr);
     }
+    g_signals_ready = true;
 
     write_pid(1);
 
     for (;;) {
-        int count = init_iqn_list();
-        if (count < 0) {
+        int count = load_targets();
+        if (count < 0 && !is_stop(g_pending_event)) {
             // The pid stays stored, as of a daemon that died.
             _iqn_clear();
             return -1;
@@ -499,12 +609,12 @@ int nesrad_main(int argc, char **argv, unsigned poll_interval)
         if (count > 0 && target_register_iSNS_all() == 0)
             g_registered = 1;
 
-        wake how = wait_for_event(count, &open_mask);
+        wake how = wait_for_event(count);
 
         target_deregister_entity_identifier();
         _iqn_clear();
         if (how == wake::stop) {
-            write_pid(0);
+            clear_pid();
             return 0;
         }
     }

@@ -6,7 +6,8 @@
  * driver, registers the first target as the entity and the rest as further
  * nodes of it, then checks once an interval that the server still holds the
  * first node. SIGUSR1/SIGUSR2 mean "the configuration changed: deregister,
- * read again, register again"; SIGTERM deregisters and exits. All protocol
+ * read again, register again"; SIGTERM (or SIGINT) deregisters and exits.
+ * One daemon runs per system root ("/var/run/nesrad.lock"). All protocol
  * state (server address, entity identifier, entity name) lives in isns/. */
 #ifndef DAEMON_NESRAD_H
 #define DAEMON_NESRAD_H
@@ -92,14 +93,22 @@ int target_deregister_entity_identifier(void);
 
 /* ---- entry ---- */
 
+/* Milliseconds between two checks of the server: the poll interval, or two
+ * thirds of the server's registration period (never below 5 s) when that
+ * period is shorter than two intervals. period 0: the server gave none. */
+unsigned nesrad_check_interval_ms(unsigned poll_interval, unsigned period);
+
 /* Stores getpid() (on != 0) or 0 as the daemon's pid in the configuration
  * store; a failure is logged and returned. */
 int write_pid(int on);
 
-/* The whole daemon: start-up from argv[1], then the main loop with the given
- * number of seconds between server checks. Returns the process exit status:
- * 0 after SIGTERM, 1 for argument, configuration or address failures, -1
- * (255) when the targets cannot be read. Call once per process. */
+/* The whole daemon: start-up from argv[1] ("--help" and "--version" print and
+ * return 0), then the main loop with the given number of seconds between
+ * server checks. Returns the process exit status: 0 after SIGTERM or SIGINT,
+ * 1 for argument, configuration or address failures and when another daemon
+ * keeps the lock for 20 s, -1 (255) when the targets cannot be read (after
+ * 10 s of retries when the configuration service does not answer). Call once
+ * per process. */
 int nesrad_main(int argc, char **argv, unsigned poll_interval);
 
 #ifdef __cplusplus

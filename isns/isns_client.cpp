@@ -14,6 +14,7 @@
 
 char isns_entity_id[128];
 char isns_entity_name[256];
+uint32_t isns_registration_period;
 
 namespace {
 
@@ -94,6 +95,8 @@ int register_with(isns_iscsi_node *node, bool entity)
     }
     emit_reg_node(node);
     const int r = send_and_recv();
+    if (entity)
+        isns_registration_period = _isns_registration_period(r);
     return r < 0 ? r : 0;
 }
 
@@ -129,6 +132,18 @@ int query_entity(const char *name)
     emit_delimiter();
     emit_attr(ISNS_TAG_ISCSI_NAME, nullptr);
     return _isns_query_result(send_and_recv());
+}
+
+unsigned _isns_registration_period(int n)
+{
+    uint32_t period = 0;
+    if (n >= 4)
+        walk_attrs(isns_pdu_buf, 4, static_cast<size_t>(n), [&](const attr &a) {
+            if (a.tag == ISNS_TAG_REGISTRATION_PERIOD && a.len == 4)
+                period = be32(a.value);
+            return period == 0;
+        });
+    return period;
 }
 
 int _isns_query_result(int r)

@@ -24,8 +24,15 @@ extern char isns_entity_id[128];
  * clears it (all zero) after deregistering. */
 extern char isns_entity_name[256];
 
+/* Registration Period (RFC 4171, 6.2.6; seconds) that the server gave in its
+ * answer to the last register_entity(); 0 when it gave none or did not
+ * answer. The server drops the entity when neither a registration nor a query
+ * from one of its nodes comes within the period. */
+extern uint32_t isns_registration_period;
+
 /* DevAttrReg of the entity with this first node, its portals and portal
- * groups. REQUIRES: isns_entity_name already holds node->name.
+ * groups; sets isns_registration_period from the answer.
+ * REQUIRES: isns_entity_name already holds node->name.
  * 0, or the negative result of send_and_recv(); -1 for a NULL node. */
 int register_entity(isns_iscsi_node *node);
 

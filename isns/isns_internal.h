@@ -20,6 +20,10 @@ int _isns_query_result(int r);
  * isns_check_registration() for node `name`. */
 int _isns_check_result(const char *name, int r);
 
+/* n: the result of send_and_recv() for a registration. The Registration
+ * Period the response carries (tag 6, 4 bytes), or 0. */
+unsigned _isns_registration_period(int n);
+
 #ifdef __cplusplus
 }
 #endif

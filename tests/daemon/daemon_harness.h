@@ -8,6 +8,7 @@
 #include <sys/types.h>
 
 #include <chrono>
+#include <cstdio>
 #include <initializer_list>
 #include <set>
 #include <string>
@@ -90,6 +91,26 @@ public:
 private:
     pid_t pid_ = -1;
     std::string log_;
+};
+
+// A shell as pid 1 of a PID namespace of its own (unshare, as root), for
+// what signals by name ("killall"): it reaches only what the shell started,
+// and everything in the namespace dies with the shell.
+class pid_namespace_shell {
+public:
+    pid_namespace_shell();
+    ~pid_namespace_shell();
+    pid_namespace_shell(const pid_namespace_shell &) = delete;
+    pid_namespace_shell &operator=(const pid_namespace_shell &) = delete;
+    // True when the shell runs as pid 1 of its own namespace.
+    bool ok() { return pid_ > 0 && run("echo $$") == "1"; }
+    // Runs one command line that prints one line; returns that line.
+    std::string run(const std::string &cmd);
+
+private:
+    pid_t pid_ = -1;
+    int fd_ = -1;
+    FILE *from_ = nullptr;
 };
 
 // Polls pred every 50 ms until it holds or the time is over.

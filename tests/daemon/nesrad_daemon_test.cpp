@@ -9,6 +9,7 @@
 #include <signal.h>
 
 #include <atomic>
+#include <functional>
 #include <chrono>
 #include <memory>
 #include <set>
@@ -18,6 +19,7 @@
 
 #include <gtest/gtest.h>
 
+#include "platform/xmldbc.h"
 #include "tests/daemon/daemon_harness.h"
 #include "tests/support/isns_isnsd.h"
 #include "tests/support/isns_test_server.h"
@@ -56,12 +58,13 @@ void expect_once_per_interval(const std::vector<clock_type::time_point> &at)
     EXPECT_LE(mean, kInterval * 3 / 2) << "slower than once per interval";
 }
 
-// An appliance with its configuration service and host name NAS_Box1.
+// An appliance with its configuration service (which loads the saved
+// configuration file at every start) and host name NAS_Box1.
 class Appliance : public ::testing::Test {
 protected:
     void SetUp() override { set_host_name("NAS_Box1"); }
 
-    XmldbService db_;
+    XmldbService db_{false, SysRoot::file("/etc/NAS_CFG/config.xml")};
 };
 
 // ... and a private isnsd on the test's own address.
@@ -73,9 +76,9 @@ protected:
         if (!isnsd_available())
             GTEST_SKIP() << "isnsd not installed";
     }
-    void start_isnsd(const std::string &address, bool now = true)
+    void start_isnsd(const std::string &address, bool now = true, int period = 0)
     {
-        srv_ = std::make_unique<isnsd_server>(address);
+        srv_ = std::make_unique<isnsd_server>(address, period);
         if (now) {
             ASSERT_TRUE(srv_->start()) << srv_->error();
         }
@@ -122,6 +125,7 @@ TEST_F(Appliance, StartUpFailuresExitWithTheirStatusAndMessages)
     store_targets(kEid, three_targets());
     struct {
         std::string arg, says, never;
+        int status = 1;
     } cases[] = {
         {"", "isns host address not given", ""},
         {std::string(256, 'a'), "isns host address length exceed max len = 255\n", ""},
@@ -129,21 +133,24 @@ TEST_F(Appliance, StartUpFailuresExitWithTheirStatusAndMessages)
         // over 63 characters is refused without asking any name server).
         {std::string(255, 'a'), "getaddrinfo return", "exceed"},
         {"unresolvable..name", "getaddrinfo return", ""},
+        {"--help", "usage: nesrad <server>\n", "resolve", 0},
+        {"--version", "nesrad " NESRAD_VERSION "\n", "resolve", 0},
     };
     for (auto &c : cases) {
         daemon_process d(nesrad_test_binary(), c.arg);
-        EXPECT_EQ(1, d.wait_exit(5s)) << c.arg.size();
+        EXPECT_EQ(c.status, d.wait_exit(5s)) << c.arg.substr(0, 10);
         EXPECT_GE(d.count(c.says), 1) << d.output();
         EXPECT_EQ(0, c.never.empty() ? 0 : d.count(c.never)) << d.output();
     }
     EXPECT_LE(stored_pid(), 0) << "no failed start stores a pid";
 
-    // The database gone: 255. (A broken record alone no longer fails the
-    // read: the store skips it and hands out the others.)
+    // The database gone: asked again once a second for 10 s, then 255. (A
+    // broken record alone does not fail the read: the store skips it.)
     db_.stop();
     daemon_process d(nesrad_test_binary(), "127.20.1.2");
     EXPECT_EQ(255, d.wait_exit(20s));
     EXPECT_GE(d.count("get target conf from config failed"), 1) << d.output();
+    EXPECT_NEAR(10, d.count("configuration service not answering"), 1) << d.output();
 }
 
 TEST_F(Appliance, InstalledDaemonResolvesAHostNameAndNeedsOne)
@@ -208,8 +215,23 @@ TEST_F(WithIsnsd, RegistersEveryTargetAndFollowsSignals)
     EXPECT_EQ(1, d.count("Received event SIGUSR1(10)"));
     EXPECT_EQ(1, d.count("Received event SIGUSR2(12)"));
 
+    // A second daemon waits for the first, and gives up after 20 s.
+    const auto started = clock_type::now();
+    daemon_process d2(nesrad_test_binary(), "127.20.2.1");
+    EXPECT_EQ(1, d2.wait_exit(30s)) << d2.output();
+    EXPECT_GE(clock_type::now() - started, 19s);
+    EXPECT_EQ(1, d2.count("another nesrad is running\n")) << d2.output();
+    EXPECT_EQ(d.pid(), stored_pid());
+
+    // One that starts before the first stops takes over once it is gone.
+    daemon_process d3(nesrad_test_binary(), "127.20.2.1");
+    ASSERT_TRUE(d3.wait_for("waiting for the running nesrad to stop", 5s)) << d3.output();
     d.signal(SIGTERM);
     EXPECT_EQ(0, d.wait_exit(5s)) << d.output();
+    EXPECT_TRUE(eventually([&] { return stored_pid() == d3.pid(); }, 5s));
+    EXPECT_TRUE(holds(iqns("nas-box2", {"t1", "t2", "t3"}), 5s)) << d3.output();
+    d3.signal(SIGINT);
+    EXPECT_EQ(0, d3.wait_exit(5s)) << d3.output();
     EXPECT_TRUE(entity_ids(*srv_).empty()) << srv_->adm("--list entities");
     EXPECT_TRUE(node_names(*srv_).empty());
     EXPECT_EQ(0, stored_pid());
@@ -302,6 +324,99 @@ TEST_F(Appliance, SignalDuringAnExchangeIsActedOnRightAfterIt)
     EXPECT_EQ(1, d.count("Received event SIGUSR1(10)"));
 }
 
+TEST_F(Appliance, StopDuringAPassWaitsForOneExchangeAtMost)
+{
+    std::vector<target_spec> targets;
+    for (int i = 1; i <= 8; ++i)
+        targets.push_back({"t" + std::to_string(i), i});
+    store_targets(kEid, targets);
+    // The management tool's pacing against a silent server (1 s per
+    // exchange), and a server trickling every answer past the 5-s receive
+    // deadline: either way the pass is cut after the exchange in hand.
+    struct {
+        const char *server;
+        isns_fake_reply reply;
+        std::vector<int> signals;  // 1 s apart
+        std::chrono::seconds exchange;
+        size_t most;  // requests in all, the deregistration included
+    } cases[] = {
+        {"127.20.3.6", {{}, 0, 0, 1000}, {SIGUSR1, SIGUSR1, SIGTERM}, 1s, 5},
+        {"127.20.3.7", {isns_pdu(0x8001, 0x4c00, {0, 0, 0, 0}), 1, 700}, {SIGTERM}, 5s, 2},
+    };
+    for (auto &c : cases) {
+        isns_fake_server srv(c.server);
+        ASSERT_TRUE(srv.ok()) << srv.error();
+        srv.set_reply(c.reply);
+        daemon_process d(nesrad_binary(), c.server);
+        ASSERT_TRUE(eventually([&] { return !srv.requests().empty(); }, 5s)) << d.output();
+        for (size_t i = 0; i < c.signals.size(); ++i) {
+            std::this_thread::sleep_for(i ? 1s : 0s);
+            d.signal(c.signals[i]);
+        }
+        // The exchange in hand and the deregistration, with time to spare.
+        EXPECT_EQ(0, d.wait_exit(2 * c.exchange + 3s)) << c.server << d.output();
+        // The server reads each request only when done with the one before.
+        EXPECT_TRUE(eventually([&] { return func_of(srv.requests().back()) == ISNS_DEREG; }, 2 * c.exchange + 3s));
+        EXPECT_LE(srv.requests().size(), c.most) << c.server;
+    }
+}
+
+TEST_F(WithIsnsd, AStopArrivingWithAReloadIsNeverLost)
+{
+    start_isnsd("127.20.3.8");
+    store_targets(kEid, three_targets());
+    // Both arrive while the registration holds them back; SIGINT is a stop.
+    for (int i = 0; i < 30; ++i) {
+        const int stop = i % 2 ? SIGTERM : SIGINT;
+        daemon_process d(nesrad_test_binary(), "127.20.3.8");
+        ASSERT_TRUE(eventually([&] { return stored_pid() == d.pid(); }, 5s)) << d.output();
+        d.signal(i % 4 < 2 ? SIGUSR1 : stop);
+        d.signal(i % 4 < 2 ? stop : SIGUSR1);
+        ASSERT_EQ(0, d.wait_exit(5s)) << "run " << i << d.output();
+        EXPECT_EQ(0, stored_pid()) << "run " << i;
+        EXPECT_TRUE(entity_ids(*srv_).empty()) << "run " << i;
+    }
+}
+
+/* ---- restarts ---- */
+
+// The management tool's restart, "killall -SIGTERM nesrad" then a new daemon
+// at once, 30 times: the stored pid is the running daemon's once the old one
+// is gone, and a healthy server holds the registration a moment later.
+class Restarts : public WithIsnsd {
+protected:
+    void restart_30_times(const std::string &server, const std::function<bool()> &registered)
+    {
+        pid_namespace_shell sh;
+        if (!sh.ok())
+            GTEST_SKIP() << "killall needs a PID namespace of the test's own (root, unshare)";
+        const std::string restart =
+            "killall -SIGTERM nesrad 1>/dev/null 2>/dev/null; " + nesrad_binary() + " " + server + " >/dev/null 2>&1 & echo $!";
+        for (int i = 0; i < 30; ++i) {
+            const std::string pid = sh.run(restart);
+            ASSERT_TRUE(eventually([&] { return sh.run("echo $(pidof nesrad)") == pid; }, 30s)) << "run " << i;
+            EXPECT_TRUE(eventually([&] { return std::to_string(stored_pid()) == pid; }, 5s)) << "run " << i;
+            EXPECT_TRUE(eventually(registered, 5s)) << "run " << i;
+        }
+    }
+};
+
+TEST_F(Restarts, AgainstAHealthyServer)
+{
+    start_isnsd("127.20.3.9");
+    store_targets(kEid, three_targets());
+    restart_30_times("127.20.3.9", [&] { return node_names(*srv_) == iqns(kEid, {"t1", "t2", "t3"}); });
+}
+
+TEST_F(Restarts, AgainstASilentServer)
+{
+    isns_fake_server srv("127.20.3.10");
+    ASSERT_TRUE(srv.ok()) << srv.error();
+    srv.set_reply({{}, 0, 0, 1000});
+    store_targets(kEid, {{"t1", 1}});
+    restart_30_times("127.20.3.10", [] { return true; });
+}
+
 /* ---- server faults ---- */
 
 TEST_F(WithIsnsd, ServerDownAtStartOrRestartedEmptyGetsEverythingAgain)
@@ -341,6 +456,39 @@ TEST_F(Appliance, RefusingServerGetsOneDeregistrationAndOneRegistrationPerInterv
                   (std::vector<uint16_t>{got[i], got[i + 1], got[i + 2]}))
             << "pass " << (i + 2) / 3;
     }
+}
+
+TEST_F(WithIsnsd, ShortRegistrationPeriodNeverLetsTheTargetsExpire)
+{
+    // 20 s: the installed daemon's minute would lose them two times in three.
+    start_isnsd("127.20.4.5", true, 20);
+    store_targets(kEid, three_targets());
+    daemon_process d(nesrad_binary(), "127.20.4.5");
+    const std::set<std::string> all = iqns(kEid, {"t1", "t2", "t3"});
+    ASSERT_TRUE(holds(all, 5s)) << d.output();
+    int missing = 0;
+    for (auto at = clock_type::now(), end = at + 120s; at < end; std::this_thread::sleep_until(at += 1s))
+        missing += node_names(*srv_) != all;
+    EXPECT_EQ(0, missing) << "seconds without the targets" << d.output();
+    EXPECT_EQ(0, d.count("reinit")) << d.output();
+}
+
+TEST_F(WithIsnsd, ConfigurationServiceDownDuringAReloadIsWaitedFor)
+{
+    start_isnsd("127.20.4.6");
+    store_targets(kEid, three_targets());
+    ASSERT_EQ(0, xml_write_file("/etc/NAS_CFG/config.xml")) << "what the service loads when it comes back";
+    daemon_process d(nesrad_test_binary(), "127.20.4.6");
+    const std::set<std::string> all = iqns(kEid, {"t1", "t2", "t3"});
+    ASSERT_TRUE(holds(all, 5s)) << d.output();
+    db_.stop();
+    d.signal(SIGUSR1);
+    ASSERT_TRUE(holds({}, 5s)) << "deregistered for the reload";
+    std::this_thread::sleep_for(3s);
+    db_.restart();
+    EXPECT_TRUE(holds(all, 5s)) << d.output();
+    d.signal(SIGTERM);
+    EXPECT_EQ(0, d.wait_exit(5s)) << d.output();
 }
 
 /* ---- resources ---- */

@@ -112,6 +112,15 @@ TEST(AddressText, HostNameAndIpv4Conversions)
               (std::vector<int>{b[12], b[13], b[14], b[15]}));
 }
 
+TEST(CheckInterval, AShortRegistrationPeriodIsCheckedAtTwoThirdsOfIt)
+{
+    struct {
+        unsigned period, ms;
+    } cases[] = {{0, 60000}, {3600, 60000}, {120, 60000}, {119, 79333}, {20, 13333}, {7, 5000}, {1, 5000}};
+    for (auto c : cases)
+        EXPECT_EQ(c.ms, nesrad_check_interval_ms(60, c.period)) << c.period;
+}
+
 TEST_F(InRoot, ListAndNodesFollowTheStoreAndTheKernel)
 {
     std::vector<target_spec> targets = {{"t1", 5}, {"t2", 2}, {"t3", 3}};

@@ -29,7 +29,8 @@ bool isnsd_available()
     return !find_tool("isnsd").empty() && !find_tool("isnsadm").empty();
 }
 
-isnsd_server::isnsd_server(std::string address) : address_(std::move(address))
+isnsd_server::isnsd_server(std::string address, int registration_period)
+    : address_(std::move(address)), period_(registration_period)
 {
     char tmpl[] = "/tmp/korv-isnsd-XXXXXX";
     if (mkdtemp(tmpl))
@@ -64,7 +65,7 @@ bool isnsd_server::start()
              << "ControlSocket = " << dir_ << "/isnsctl\n"
              << "LocalRegistry = " << dir_ << "/isns.registry\n"
              << "Security = 0\nSLPRegister = 0\nDefaultDiscoveryDomain = 1\n"
-             << "RegistrationPeriod = 0\nESIRetries = 0\n";
+             << "RegistrationPeriod = " << period_ << "s\nESIRetries = 0\n";
         std::ofstream adm(dir_ + "/isnsadm.conf");
         adm << "SourceName = iqn.2026-01.test:isnsadm\n"
             << "ControlSocket = " << dir_ << "/isnsctl\n"

@@ -3,7 +3,8 @@
 // isnsd_server runs one isnsd in the foreground, bound to one loopback
 // address on port 3205, with everything (config, pid file, control socket,
 // registry) in its own temporary directory, no authentication, no
-// registration expiry, and an in-memory database (a restart empties it). It
+// registration expiry unless a period is given, and an in-memory database (a
+// restart empties it). It
 // is stopped (SIGTERM) by stop() or the destructor; a server it did not start
 // is never touched.
 //
@@ -28,8 +29,10 @@ bool isnsd_available();
 
 class isnsd_server {
 public:
-    // address: IPv4 ("127.10.3.1") or IPv6 ("::1") text. Nothing starts yet.
-    explicit isnsd_server(std::string address);
+    // address: IPv4 ("127.10.3.1") or IPv6 ("::1") text; registration_period:
+    // seconds after which an entity that neither registers nor queries
+    // expires (0: never). Nothing starts yet.
+    explicit isnsd_server(std::string address, int registration_period = 0);
     ~isnsd_server();
     isnsd_server(const isnsd_server &) = delete;
     isnsd_server &operator=(const isnsd_server &) = delete;
@@ -48,6 +51,7 @@ public:
 
 private:
     std::string address_;
+    int period_;
     std::string dir_;
     std::string error_;
     child_process proc_;

@@ -40,6 +40,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size)
     const int n = recv_response(sv[1]);
     if (n < 0 || n > ISNS_PDU_SIZE || static_cast<size_t>(n) > size)
         __builtin_trap();
+    (void)_isns_registration_period(_isns_response_status(n));
     const int r = _isns_query_result(_isns_response_status(n));
     const int held = _isns_check_result(kName, r);
     if (held < -1 || held > 1)
