@@ -4,7 +4,6 @@
 #include <fcntl.h>
 #include <signal.h>
 #include <sys/prctl.h>
-#include <sys/socket.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -177,19 +176,6 @@ bool daemon_process::wait_for(const std::string &text, std::chrono::milliseconds
     return eventually([&] { return count(text) >= n; }, limit);
 }
 
-std::vector<std::chrono::steady_clock::time_point>
-daemon_process::arrivals(const std::string &text, int n, std::chrono::milliseconds limit) const
-{
-    std::vector<std::chrono::steady_clock::time_point> seen;
-    eventually(
-        [&] {
-            seen.resize(std::min(count(text), n), std::chrono::steady_clock::now());
-            return static_cast<int>(seen.size()) >= n;
-        },
-        limit);
-    return seen;
-}
-
 int daemon_process::open_fds() const
 {
     std::error_code ec;
@@ -199,48 +185,6 @@ int daemon_process::open_fds() const
     return static_cast<int>(std::count_if(begin(fds), end(fds), [&](const auto &e) {
         return std::stoi(e.path().filename().string()) < 1024;
     }));
-}
-
-pid_namespace_shell::pid_namespace_shell()
-{
-    int sv[2];
-    if (socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, sv) != 0)
-        return;
-    std::fflush(nullptr);
-    pid_ = fork();
-    if (pid_ == 0) {
-        prctl(PR_SET_PDEATHSIG, SIGKILL);
-        dup2(sv[1], STDIN_FILENO);
-        dup2(sv[1], STDOUT_FILENO);
-        execlp("unshare", "unshare", "--pid", "--fork", "--mount-proc", "--kill-child", "sh", nullptr);
-        _exit(127);
-    }
-    close(sv[1]);
-    fd_ = sv[0];
-    from_ = fdopen(dup(fd_), "r");
-}
-
-pid_namespace_shell::~pid_namespace_shell()
-{
-    if (fd_ >= 0)
-        shutdown(fd_, SHUT_WR);  // the shell ends, and the namespace with it
-    if (pid_ > 0)
-        waitpid(pid_, nullptr, 0);
-    if (from_)
-        std::fclose(from_);
-    if (fd_ >= 0)
-        close(fd_);
-}
-
-std::string pid_namespace_shell::run(const std::string &cmd)
-{
-    const std::string line = cmd + "\n";
-    char buf[256];
-    if (!from_ || send(fd_, line.data(), line.size(), MSG_NOSIGNAL) != static_cast<ssize_t>(line.size()) ||
-        !std::fgets(buf, sizeof buf, from_))
-        return {};
-    std::string got(buf);
-    return got.substr(0, got.find('\n'));
 }
 
 }  // namespace korv_test

@@ -8,7 +8,6 @@
 #include <sys/types.h>
 
 #include <chrono>
-#include <cstdio>
 #include <initializer_list>
 #include <set>
 #include <string>
@@ -80,10 +79,6 @@ public:
     int count(const std::string &text) const;
     // Waits until the output holds `text` at least n times.
     bool wait_for(const std::string &text, std::chrono::milliseconds limit, int n = 1) const;
-    // Waits for n occurrences of `text` and returns when each was first seen
-    // (fewer when the time ran out).
-    std::vector<std::chrono::steady_clock::time_point> arrivals(const std::string &text, int n,
-                                                                std::chrono::milliseconds limit) const;
     // Open descriptors of the running process below 1024 (valgrind's own
     // sit high); -1 when unreadable.
     int open_fds() const;
@@ -91,26 +86,6 @@ public:
 private:
     pid_t pid_ = -1;
     std::string log_;
-};
-
-// A shell as pid 1 of a PID namespace of its own (unshare, as root), for
-// what signals by name ("killall"): it reaches only what the shell started,
-// and everything in the namespace dies with the shell.
-class pid_namespace_shell {
-public:
-    pid_namespace_shell();
-    ~pid_namespace_shell();
-    pid_namespace_shell(const pid_namespace_shell &) = delete;
-    pid_namespace_shell &operator=(const pid_namespace_shell &) = delete;
-    // True when the shell runs as pid 1 of its own namespace.
-    bool ok() { return pid_ > 0 && run("echo $$") == "1"; }
-    // Runs one command line that prints one line; returns that line.
-    std::string run(const std::string &cmd);
-
-private:
-    pid_t pid_ = -1;
-    int fd_ = -1;
-    FILE *from_ = nullptr;
 };
 
 // Polls pred every 50 ms until it holds or the time is over.
