@@ -7,10 +7,8 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <cstdio>
 #include <cstdlib>
-#include <filesystem>
 #include <fstream>
 #include <iterator>
 #include <map>
@@ -174,17 +172,6 @@ int daemon_process::count(const std::string &text) const
 bool daemon_process::wait_for(const std::string &text, std::chrono::milliseconds limit, int n) const
 {
     return eventually([&] { return count(text) >= n; }, limit);
-}
-
-int daemon_process::open_fds() const
-{
-    std::error_code ec;
-    auto fds = std::filesystem::directory_iterator("/proc/" + std::to_string(pid_) + "/fd", ec);
-    if (ec)
-        return -1;
-    return static_cast<int>(std::count_if(begin(fds), end(fds), [&](const auto &e) {
-        return std::stoi(e.path().filename().string()) < 1024;
-    }));
 }
 
 }  // namespace korv_test

@@ -79,9 +79,6 @@ public:
     int count(const std::string &text) const;
     // Waits until the output holds `text` at least n times.
     bool wait_for(const std::string &text, std::chrono::milliseconds limit, int n = 1) const;
-    // Open descriptors of the running process below 1024 (valgrind's own
-    // sit high); -1 when unreadable.
-    int open_fds() const;
 
 private:
     pid_t pid_ = -1;

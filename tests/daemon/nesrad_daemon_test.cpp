@@ -154,14 +154,14 @@ TEST_F(Appliance, StartUpFailuresExitWithTheirStatusAndMessages)
     // The database gone: asked again once a second for 10 s, then 255. (A
     // broken record alone does not fail the read: the store skips it.)
     db_.stop();
-    daemon_process d(nesrad_test_binary(), "127.20.1.2");
-    EXPECT_EQ(255, d.wait_exit(20s));
-    EXPECT_GE(d.count("get target conf from config failed"), 1) << d.output();
-    EXPECT_NEAR(10, d.count("configuration service not answering"), 1) << d.output();
-}
+    {
+        daemon_process d(nesrad_test_binary(), "127.20.1.2");
+        EXPECT_EQ(255, d.wait_exit(20s));
+        EXPECT_GE(d.count("get target conf from config failed"), 1) << d.output();
+        EXPECT_NEAR(10, d.count("configuration service not answering"), 1) << d.output();
+    }
+    db_.restart();
 
-TEST_F(Appliance, InstalledDaemonResolvesAHostNameAndNeedsOne)
-{
     // The installed daemon is linked statically: its host lookup must work.
     // Without targets nothing goes to that server; the daemon is killed.
     store_targets(kEid, {});
@@ -470,10 +470,12 @@ TEST_F(WithIsnsd, ManyReloadsLeakNothingAndKeepTheDescriptors)
 #endif
     daemon_process d(nesrad_test_binary(), "127.20.5.1", wrapper);
     const std::string last = "register iqn=" + target_iqn(kEid, "t3");
-    // Descriptors are counted once the pass's last exchange is surely over.
+    // Descriptors (below valgrind's own, which sit high) are counted once the
+    // pass's last exchange is surely over.
     auto idle_fds = [&] {
         std::this_thread::sleep_for(500ms);
-        return d.open_fds();
+        auto fds = std::filesystem::directory_iterator("/proc/" + std::to_string(d.pid()) + "/fd");
+        return std::count_if(begin(fds), end(fds), [](auto &e) { return std::stoi(e.path().filename()) < 1024; });
     };
     ASSERT_TRUE(d.wait_for(last, limit)) << d.output();
     int fds = idle_fds();
