@@ -5,8 +5,9 @@
 // in-memory isnsd on 127.30.0.1, then times, alternating, N runs of:
 //   daemon  the installed nesrad from exec until its exit: start-up, the
 //           configuration read, 64 registrations, then the SIGTERM sent as
-//           soon as its handler is installed (held blocked until the daemon
-//           waits), one deregistration and the pid cleared: 65 exchanges;
+//           soon as it waits for its first check (a stop during the pass
+//           would cut it), one deregistration and the pid cleared: 65
+//           exchanges;
 //   floor   this program re-executed in --floor mode: the same 65 exchanges,
 //           the same bytes (same encoder, names and portals), no
 //           configuration and no kernel reads;
@@ -21,6 +22,7 @@
 #include <signal.h>
 #include <sys/resource.h>
 #include <sys/stat.h>
+#include <sys/syscall.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -116,14 +118,13 @@ outcome reap(const child &c)
     return {ms, ru.ru_maxrss, WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status)};
 }
 
-// True once the process has a handler for SIGTERM (bit 15 of SigCgt).
-bool catches_sigterm(pid_t pid)
+// True once the daemon waits for its next check, blocked in ppoll with its
+// registration pass done: a stop sent during the pass would cut it short.
+bool waiting_for_check(pid_t pid)
 {
-    std::ifstream in("/proc/" + std::to_string(pid) + "/status");
-    for (std::string line; std::getline(in, line);)
-        if (line.rfind("SigCgt:", 0) == 0)
-            return (std::strtoull(line.c_str() + 7, nullptr, 16) >> (SIGTERM - 1)) & 1;
-    return false;
+    std::ifstream in("/proc/" + std::to_string(pid) + "/syscall");
+    long nr = -1;
+    return in >> nr && nr == SYS_ppoll;
 }
 
 long status_kib(pid_t pid, const char *field)
@@ -135,14 +136,14 @@ long status_kib(pid_t pid, const char *field)
     return -1;
 }
 
-// nesrad until its handler exists, then SIGTERM; or, with verify, until isnsd
-// holds every target (reported through *held and *hwm_kib) first.
+// nesrad until it has registered and waits, then SIGTERM; with verify,
+// isnsd's view (through *held and *hwm_kib) is read before the signal.
 outcome run_daemon(const std::string &adm_conf, bool verify, int *held, long *hwm_kib)
 {
     child c = spawn({NESRAD_BIN, kServer});
-    while (!catches_sigterm(c.pid)) {
+    while (!waiting_for_check(c.pid)) {
         if (waitpid(c.pid, nullptr, WNOHANG) == c.pid)
-            die("nesrad ended before installing its handler");
+            die("nesrad ended before its first wait");
         std::this_thread::sleep_for(std::chrono::microseconds(100));
     }
     if (verify) {
