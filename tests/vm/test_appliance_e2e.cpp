@@ -166,7 +166,9 @@ void build_target(const std::string &name, int hba)
     ASSERT_EQ(xmldb_set_lun_acl(kInitiator, "host1", lun_name.c_str(), 2), 0);
 
     vm::Target t = vm::make_target(iqn, 1, name);
-    ASSERT_TRUE(t && vm::want_portal(t.get(), kAddress, "", 3260));
+    ASSERT_TRUE(t);
+    t->dataout_timeout = 5;
+    ASSERT_TRUE(vm::want_portal(t.get(), kAddress, "", 3260));
     ASSERT_EQ(iscsi_mod_add_target(t.get()), 0);
     ASSERT_EQ(iscsi_mod_set_target_ip(t.get()), 0);
     t->chap = 1;
