@@ -20,17 +20,6 @@ protected:
     int saved_ = 0;
 };
 
-TEST_F(LogTest, PrintsUnitFunctionLineThenMessage)
-{
-    g_korv_debug_level = 2;
-    int line = 0;
-    std::string out = capture_stdout([&] {
-        line = __LINE__ + 1;
-        DBG(2, "get debug level = %d", 2);
-    });
-    EXPECT_EQ(out, "(test_log:operator():" + std::to_string(line) + "):get debug level = 2\n");
-}
-
 TEST_F(LogTest, UnitIsTheFileWithoutDirectoryOrExtensionAndTheMessageIsKeptAsIs)
 {
     g_korv_debug_level = 0;
@@ -54,7 +43,7 @@ TEST_F(LogTest, NothingAtAllAboveTheDebugLevelAndANegativeLevelSilencesErrorsToo
     }
 }
 
-TEST_F(LogTest, FlushesEvenWhenNothingPrints)
+TEST_F(LogTest, PrefixIsUnitFunctionLineAndFlushesEvenWhenNothingPrints)
 {
     // Raw writes to the descriptor (as a child shell's would be) must land
     // after whatever stdio held before the statement.
@@ -63,10 +52,10 @@ TEST_F(LogTest, FlushesEvenWhenNothingPrints)
         std::printf("pending");
         DBG(3, "hidden");
         (void)!write(1, "|", 1);
-        DBG(0, "shown");
+        DBG(0, "shown %d", 2);
         (void)!write(1, "|", 1);
     });
-    EXPECT_EQ(out, "pending|(test_log:operator():" + std::to_string(__LINE__ - 3) + "):shown\n|");
+    EXPECT_EQ(out, "pending|(test_log:operator():" + std::to_string(__LINE__ - 3) + "):shown 2\n|");
 }
 
 }  // namespace
