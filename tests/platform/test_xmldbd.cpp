@@ -201,7 +201,9 @@ TEST(XmldbBadInput, ConnectionFloodsNeitherLockOthersOutNorMakeTheServiceSpin)
     std::deque<RawClient> flood(30);
     const size_t ticks = proc_figure(pid, "ticks");
     ::usleep(1000 * 1000);
-    EXPECT_LT(proc_figure(pid, "ticks") - ticks, ::sysconf(_SC_CLK_TCK) / 10) << "the service spins";
+    // A spinning service burns most of a core; a quarter of one leaves room
+    // for a loaded machine (or a sanitizer build) shedding the flood.
+    EXPECT_LT(proc_figure(pid, "ticks") - ticks, ::sysconf(_SC_CLK_TCK) / 4) << "the service spins";
     for (int i = 0; i < 20; ++i)
         flood.pop_front();
     EXPECT_EQ(flood.back().ask(xmldb::Op::Ping, "/"), std::string(1, xmldb::kOk) + "xmldbd");
