@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 # Small helpers shared by every directory's CMakeLists.
 
 # korv_library(NAME DIR SOURCES... HEADERS... [DEPS libs...])

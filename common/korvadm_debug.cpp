@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reading the stored debug level into the process-wide one.
 #include "common/korvadm_debug.h"
 

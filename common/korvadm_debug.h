@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 /* The stored debug level: read once at start-up from the configuration store
  * into the process-wide level that gates every log statement. */
 #ifndef KORVADM_DEBUG_H

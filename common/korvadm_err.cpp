@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Names of the shared result codes.
 #include "common/korvadm_err.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 /* Result codes shared by every layer of the library and the daemon.
  *
  * 0 is success; failures come from one family of negative numbers so that a

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The intrusive list operations; every collection in the program uses these.
 #include "common/korvadm_list.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 /* The intrusive doubly-linked list used for every in-memory collection.
  *
  * A record embeds a list_node_t whose `owner` points back at the record; the

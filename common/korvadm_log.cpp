@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The one implementation of the logging statement.
 #include "common/korvadm_log.h"
 

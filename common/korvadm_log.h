@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 /* Logging: one prefixed line on standard output per statement, filtered by
  * one process-wide debug level.
  *

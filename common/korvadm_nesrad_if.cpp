@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Starting, signalling and stopping nesrad from the management tool.
 #include "common/korvadm_nesrad_if.h"
 

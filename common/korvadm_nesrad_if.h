@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 /* The management tool's side of controlling nesrad. The tool never talks to
  * the daemon over a socket: it starts it as a background shell command,
  * stops it by name with killall, and signals configuration changes to the

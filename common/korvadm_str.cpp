@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The bounded copy, the shell escaping and the reader of command output.
 #include "common/korvadm_str.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 /* Small text and memory helpers every layer shares: the one bounded copy,
  * the one shell escaping, the one reader of command output and the one owner
  * of malloc'd memory.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // System information, network half: portal address entries, the addresses of
 // the links that are up, and the host name in the form an IQN accepts.
 #include "common/korvadm_sys.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 /* System information: network addresses and the host name in IQN form
  * (network half, korvadm_sys.cpp); volumes and disks (storage half,
  * korvadm_sys_storage.cpp).

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 /* What only korvadm_sys's own files (and their tests) share. */
 #ifndef KORVADM_SYS_INTERNAL_H
 #define KORVADM_SYS_INTERNAL_H

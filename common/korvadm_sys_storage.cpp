@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // System information, storage half: where volumes are mounted, whether they
 // are unlocked, how much room they have and whether their disks sleep.
 //

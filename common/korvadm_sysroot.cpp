@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The one place that reads the system-root variable and maps fixed paths.
 #include "common/korvadm_sysroot.h"
 

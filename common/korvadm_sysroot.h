@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 /* The relocatable system root.
  *
  * Every fixed absolute system path of the program (configfs, /proc, /sys,

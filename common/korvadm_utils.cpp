@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Commands, files and locks: module and path checks, file helpers, shell
 // commands, the cross-process semaphore, prealloc control, text checks.
 #include "common/korvadm_utils.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 /* Commands, files and locks: the system half of the management library's
  * utility layer.
  *

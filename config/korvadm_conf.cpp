@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Configuration records, access-right words, target names and the context.
 #include "config/korvadm_conf.h"
 

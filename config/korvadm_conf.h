@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 /* Configuration records, the configuration operations table type and the
  * configuration context.
  *

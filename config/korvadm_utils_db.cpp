@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Typed access to the configuration database and the number converters.
 #include "config/korvadm_utils_db.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 /* Database half of the utility layer: typed access to the configuration
  * database and the number converters the schema uses.
  *

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 /* The configuration store on the configuration database: the numbered-entry
  * scanner and counters the schema's lists rest on, the target schema, the
  * service settings, and the table iscsi_conf_ops that exposes them.

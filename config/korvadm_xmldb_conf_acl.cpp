@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // ACLs: the initiators known to the access lists and their rights on LUNs.
 // Each right is kept on both sides, under the initiator
 // ("/iscsi/acl/id:A/mapped_lun/id:M") and under the LUN

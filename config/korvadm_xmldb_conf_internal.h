@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What only the files of korvadm_xmldb_conf share: path building, the
 // argument guard, the key reader, the target lookup, and the underscore
 // functions of the scanner and counters (tests reach them here too).

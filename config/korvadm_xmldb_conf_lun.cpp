@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // LUNs: add, delete, existence checks, free device number, recount, and the
 // single-field operations by LUN name.
 #include <cstdint>

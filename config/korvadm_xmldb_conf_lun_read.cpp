@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // LUN records: filling one from its entry, reading one by name or volume
 // UUID, reading them all.
 #include <cstdint>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Mapping LUNs into targets. A mapping is kept twice: as an entry of the
 // target's "map_lun" list and as the LUN's "target_name" and "lun_num".
 #include <cstdint>

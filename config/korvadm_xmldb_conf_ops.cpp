@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The operations table iscsi_conf_ops: each slot names the operation, and
 // the file beside this one that holds it.
 #include <cstddef>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The numbered-entry scanner every list of the store rests on, and the
 // counters kept beside the lists.
 #include <cstdint>

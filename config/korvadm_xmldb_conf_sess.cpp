@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Session access records: per initiator seen in a session, which LUNs it
 // accessed and with what result ("/iscsi/sess/initiator").
 #include <cstdint>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Service settings, versions, saved names and addresses, and the
 // whole-store operations.
 #include <climits>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Targets: add, delete, lookups, single fields, CHAP, recount, connections.
 #include <cstdint>
 #include <cstring>

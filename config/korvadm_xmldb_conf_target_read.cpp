@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Target records: filling one, reading them all.
 #include <cstdint>
 

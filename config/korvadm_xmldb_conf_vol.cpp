@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The per-volume summaries of LUN space under "/iscsi/lun/total_size" and
 // their totals. The allocation figure of a summary is kept up by the LUN
 // operations, not measured, so a rewrite carries it over.

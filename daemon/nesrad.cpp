@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // nesrad: the iSNS client daemon (start-up, main loop, node list, registration).
 #include "daemon/nesrad.h"
 

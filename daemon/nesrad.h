@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 /* nesrad, the iSNS client daemon: start-up, the main loop, the list of nodes
  * it registers, and the registration of the configured targets.
  *

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Entry point of the installed daemon: the loop with its fixed 60-second interval.
 #include "daemon/nesrad.h"
 

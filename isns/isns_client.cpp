@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 /* iSNS operations: registration, deregistration and the registration check. */
 #include "isns/isns_client.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 /* iSNS operations of a target-only client: register an entity with its first
  * iSCSI target node, register further nodes, deregister the entity, and check
  * that the server still holds the first node.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 /* Steps of an exchange that follow the receive, split out so that the fuzz
  * target can drive them on bytes that never crossed a network. Not part of
  * the installed interface. */

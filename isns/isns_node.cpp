@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The node and portal records the registrations are built from.
 #include "isns/isns_node.h"
 

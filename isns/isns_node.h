@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 /* The records a registration is built from: one iSCSI target node and its
  * portals. The encoder (isns_pdu.h) reads them, the operations
  * (isns_client.h) send them, the daemon fills them. */

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 /* iSNSP encoder: the PDU buffer, the header and one emitter per attribute. */
 #include "isns/isns_pdu.h"
 

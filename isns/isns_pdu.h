@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 /* iSNSP message encoding (RFC 4171): the one PDU buffer and the emitters.
  *
  * Every request is built from scratch in one process-wide 10000-byte buffer:

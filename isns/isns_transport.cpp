@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 /* iSNS transport: connect with time-outs, send one PDU, read one response. */
 #include "isns/isns_transport.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 /* iSNS transport: one request, one TCP connection to the server on port 3205.
  *
  * send_and_recv() connects (non-blocking, with a select time-out), sends the

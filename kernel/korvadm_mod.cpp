@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The driver table selection, the iscsi_mod_ wrappers and the driver's records.
 #include "kernel/korvadm_mod.h"
 

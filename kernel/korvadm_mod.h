@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 /* The kernel target driver's interface: its records, the operations table
  * `iscsi_mod_ops` and the `iscsi_mod_` wrappers every caller goes through.
  *

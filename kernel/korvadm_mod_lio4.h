@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 /* The LIO back end of the kernel target driver: configfs primitives, the
  * three kernel modules, the target-side operations, backstores, LUN mapping
  * and ACLs.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Initiator ACL nodes of a portal group and their per-LUN access rights.
 #include "kernel/korvadm_mod_lio4_internal.h"
 

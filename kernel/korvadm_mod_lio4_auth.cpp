@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // CHAP: checking the settings, the authentication switch, and pushing the
 // credentials to one ACL or all of them.
 #include "kernel/korvadm_mod_lio4_internal.h"

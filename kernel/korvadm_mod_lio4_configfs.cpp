@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // configfs access: directories, attribute reads and verified writes through
 // the shell, and walking and removing configfs groups.
 #include "kernel/korvadm_mod_lio4_internal.h"

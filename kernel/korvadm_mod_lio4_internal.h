@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 /* What only the files of the LIO back end (kernel/korvadm_mod_lio4_*.cpp)
  * share: fixed paths and the path builders, the target check, configfs tree
  * helpers, and the unit's private operations. Tests reach the private

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // LUN mapping: a backstore linked into a target's portal group as a
 // numbered LUN, and unlinked again.
 #include "kernel/korvadm_mod_lio4_internal.h"

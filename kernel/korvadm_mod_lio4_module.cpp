@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The three kernel modules and the driver's start, stop and state probe.
 #include "kernel/korvadm_mod_lio4_internal.h"
 

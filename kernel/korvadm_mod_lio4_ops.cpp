@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The LIO operations table, and so the map from each slot to its file.
 #include <cstddef>
 

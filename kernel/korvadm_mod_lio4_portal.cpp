@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Network portals: directory names, creation and removal, the kernel's
 // portal list, and the replace-all and diffing setters.
 #include "kernel/korvadm_mod_lio4_internal.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The session listing: the kernel's sessions text of a portal group, read
 // from configfs and parsed line by line into session and connection records.
 //

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Backstores: fileio devices of the core tree with their ALUA state, made,
 // resized and removed one by one, and every HBA shut down when the driver
 // stops.

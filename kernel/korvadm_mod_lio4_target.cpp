@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Targets: the portal group's creation with its default attributes, the
 // enable switch, deletion, the data-out time-out, and the removal of every
 // target when the driver stops.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Session and connection records, their equality and their lists.
 #include "kernel/korvadm_sess.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 /* A target's live iSCSI sessions and their connections, as the kernel lists
  * them (lio3_get_target_session fills them; korvadm_mod_lio4.h).
  *

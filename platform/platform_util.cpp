@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The platform's utility calls: database shortcuts, the shell runner, string
 // helpers and the system queries read from /proc and /sys.
 #include "platform/platform_util.h"

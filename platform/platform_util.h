@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 /* The platform's common utility calls, as the appliance provides them.
  *
  * Database shortcuts work on the configuration database (XMLDB_SOCK_ISCSI).

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // powermgmt: the platform's power-management command, as far as the
 // management library uses it.
 //

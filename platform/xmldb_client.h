@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 /* The request path under the xmldbc_* calls, for the xmldbc tool and tests.
  *
  * One process-wide connection per socket is kept open and reused (reopened

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Whole-file reads and atomic whole-file writes.
 #include "platform/xmldb_file.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 /* Whole-file reads and crash-safe whole-file writes, shared by the database
  * service (loading and saving the tree) and the utility calls (copying the
  * saved file). Both take regular files only, up to kFileMax bytes. */

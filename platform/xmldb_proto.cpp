@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Framing of the configuration database protocol and deadline-bound socket I/O.
 #include "platform/xmldb_proto.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 /* Wire protocol between the configuration database service (xmldbd) and its
  * clients (the client library, the xmldbc tool).
  *

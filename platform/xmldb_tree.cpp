@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The in-memory tree of xmldbd, its text dump and its XML file form.
 #include "platform/xmldb_tree.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 /* The configuration database tree held by xmldbd, and its XML file form.
  *
  * A tree of text values addressed by slash-separated paths. Each segment is

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Client library of the configuration database service: the xmldbc_* calls
 // over a cached, deadline-bound connection per socket.
 #include "platform/xmldbc.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 /* Client library of the configuration database service (xmldbd).
  *
  * The same names and contracts as the appliance's own platform library, so

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // xmldbc: the configuration database from the command line, for operators
 // and scripts.
 #include "common/korvadm_sysroot.h"

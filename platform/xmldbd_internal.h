@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 /* What the files of xmldbd share: its options, its one message function and
  * the service (xmldbd_service.cpp: lock, socket, clients and their answer
  * budget; xmldbd_requests.cpp: what requests do to the tree and its files). */

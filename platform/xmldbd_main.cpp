@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // xmldbd: the configuration database service. One tree, one Unix socket, one
 // thread; requests from every client are served one at a time in arrival order.
 // This file: the command line and the process.

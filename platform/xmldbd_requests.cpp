@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What xmldbd's requests do to the tree and to its file: loading at start,
 // saving into the allowed directories, dumps sized before they are built.
 #include "platform/xmldb_file.h"

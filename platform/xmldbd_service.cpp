@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // xmldbd's service loop: the lock and the socket, clients, their buffers and
 // the budget for answers they have not read.
 #include "platform/xmldb_file.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Time to read all 64 targets (the daemon's lite read; the full read with
 // CHAP on) from a private xmldbd, next to the floor: the same number of bare
 // client reads of one value.

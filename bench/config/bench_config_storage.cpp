@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The storage side of the store against a private xmldbd, each next to its
 // anchor measured in the same run:
 // - all 128 LUNs with every field (xmldb_get_all_lun_conf), and all rights

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Memory anchor: a bare C++ program linked the way nesrad is (static-pie).
 #include <cstdio>
 #include <string>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Start-up cost and memory of nesrad with 64 targets, against its floor.
 //
 // One run makes a private system root (host name, 64 stored targets, each

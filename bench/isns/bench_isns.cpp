@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Query exchanges per second and their median latency against an in-memory
 // isnsd on loopback (127.30.0.1), next to the floor: a bare TCP
 // connect/send/receive/close loop of the very same request bytes.

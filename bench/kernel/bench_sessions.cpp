@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Time to parse a full 32768-byte sessions text (as many real-shaped blocks,
 // one session of two connections each, as fit) into records and free them,
 // next to the anchor: one pass over the same buffer counting its lines.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Memory baseline for xmldbd: a program linked the same way that only waits.
 #include "platform/xmldb_tree.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Round-trip latency of the configuration database client library against a
 // running xmldbd (in $NESRAD_SYSROOT), and filling it for the memory figure.
 //   bench_xmldb latency [ROUNDS]   get/set round trips, 128-get target scan

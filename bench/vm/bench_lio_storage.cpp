@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Runs in the test VM (bench/vm/lio_storage): 16 targets, each with a 64 MiB
 // fileio backstore, one LUN and two ACLs with rights, built and torn down
 // through the driver, against a floor that does the same configfs

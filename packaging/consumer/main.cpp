@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A program outside the tree, built against the installed library only.
 #include "common/korvadm_err.h"
 #include "common/korvadm_nesrad_if.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The intrusive list: linking, unlinking and releasing records.
 #include "common/korvadm_list.h"
 

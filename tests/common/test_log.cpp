@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The logging statement: exact prefix and message, and the debug-level filter.
 #include "common/korvadm_log.h"
 

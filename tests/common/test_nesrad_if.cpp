@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The daemon control interface: starting, restarting, stopping and
 // signalling nesrad through the shell and the stored settings, with a
 // stand-in daemon as the witness of what the shell passed, and the real

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The shared text helpers (the bounded copy, the shell escaping, the pipe
 // reader) and the argument guard.
 #include "common/korvadm_str.h"

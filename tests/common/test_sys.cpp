@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Address entries, the portal address list from the network settings and
 // the link state, the host name and the MAC address.
 #include <cstring>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Volumes and disks: room from df, mount paths and lock state, disk
 // hibernation, the chain of volumes. Real file systems (an ext4 image and a
 // tmpfs, in a private mount namespace) where a test needs mounts; stand-in

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The system root: fixed paths map under NESRAD_SYSROOT and only there.
 #include "common/korvadm_sysroot.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Commands, files and locks: the utility layer against the real file system,
 // shell and System V semaphores.
 #include "common/korvadm_utils.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A fresh configuration database service per test, with raw access to its
 // tree that bypasses the code under test.
 #pragma once

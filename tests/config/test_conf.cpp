@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Configuration records, access-right words, generated target names, the
 // configuration context and the stored debug level.
 #include <cstdlib>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Typed database access and the number converters.
 #include <climits>
 #include <cstdlib>

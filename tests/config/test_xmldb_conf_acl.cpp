@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // ACLs: initiators, rights kept on both sides, their removal, the readers,
 // and the session access records.
 #include <string>

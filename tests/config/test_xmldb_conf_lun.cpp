@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // LUNs: add, delete, recount, free device number, the field operations and
 // the record readers.
 #include <cstring>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Mapping LUNs into targets: both sides of a mapping, free LUN numbers, and
 // what a failed mapping leaves.
 #include <string>

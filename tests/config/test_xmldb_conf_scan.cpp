@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The numbered-entry scanner and the counters, and what they make of a
 // store another writer corrupted.
 #include <string>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Service settings, versions, saved names and addresses, the whole-store
 // operations, and the operations table's shape.
 #include <cstddef>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The numbered-entry scanner, the counters and the target schema.
 #include <cstring>
 #include <string>

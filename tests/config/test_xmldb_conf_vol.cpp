@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The per-volume summaries under "/iscsi/lun/total_size": lookup by UUID and
 // the rewrite from a volume list, checked against whole dumps of the store.
 #include <cstdio>

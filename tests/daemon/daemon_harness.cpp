@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The appliance in a test root, the daemon as a real process, isnsadm's view.
 #include "tests/daemon/daemon_harness.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What the daemon's tests stand on: an appliance in the test's system root
 // (host name, stored targets and IQN prefix, the kernel's portal directories),
 // the daemon run as a real process with its output in a file, and what an

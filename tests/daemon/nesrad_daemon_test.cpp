@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The daemon as a real process: start-up, registration, signals, server
 // faults and resources, against xmldbd in the test's root, a private isnsd
 // (or the fault server) on the test's own loopback address, and plain

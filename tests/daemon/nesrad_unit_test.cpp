@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The daemon's node list, address conversion and check interval, in-process
 // (configuration service in the test's root). Portals and what goes on the
 // wire are judged by a real server in nesrad_daemon_test.

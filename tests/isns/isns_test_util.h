@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Shared setup of the iSNS client tests: the client's globals in a known state.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Registration, check and deregistration against Debian's Open-iSNS server.
 #include <gtest/gtest.h>
 

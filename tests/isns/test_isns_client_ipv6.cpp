@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The client over IPv6 loopback. [::1]:3205 is the one IPv6 address loopback
 // has, so these tests hold the "isns_ipv6" lock and skip when another server
 // already listens there.

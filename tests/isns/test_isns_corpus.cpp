@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The fuzz target's seed corpus (responses of Open-iSNS isnsd to a
 // registration, a further node, a refused node, queries before and after a
 // deregistration, and the deregistration), replayed through the fuzz entry

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The node and portal records: list membership and release.
 #include <gtest/gtest.h>
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The bytes the client puts on the wire, captured by a test server.
 #include <gtest/gtest.h>
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Exchanges with a scripted server: the check's answers, malformed and
 // oversized responses, and the time limits of connect and receive.
 #include <gtest/gtest.h>

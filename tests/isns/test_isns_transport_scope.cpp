@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Link-local IPv6 servers: the scopes bond0 (when present), eth0, eth1 are
 // tried in that order, 1 s each. Each case runs in a forked child inside a
 // private network namespace whose interfaces of those names drop everything

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Builds a sample configfs tree (tests/kernel/data/*.tree) under the kernel
 // tests' system root, with a target record naming its portal group. The one
 // fixture of the LIO back end's host tests.

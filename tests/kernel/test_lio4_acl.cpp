@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // ACL nodes and per-LUN rights on plain directories: names that must stay
 // one path component, what each right writes, the target switch around
 // deny, and what a failed step leaves behind.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // CHAP settings: password lengths, names, and mutual CHAP only with one-way.
 #include <string>
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // configfs attribute I/O on plain files: line ends, buffer bounds, values
 // that must reach the file exactly and never run, and the read-back.
 #include <fcntl.h>

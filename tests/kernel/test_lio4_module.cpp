@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Starting and stopping the driver with stand-in insmod/rmmod/mount, which
 // keep the root's /proc/modules and log every call to calls.log.
 #include <cstdio>

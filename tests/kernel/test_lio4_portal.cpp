@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Portal directory names: parsing, the kernel's list, and wanted portals
 // whose names would leave the np directory.
 #include <string>

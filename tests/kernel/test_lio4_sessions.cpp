@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The session listing: the kernel's texts under tests/kernel/data/sessions
 // parsed into records (each NAME.txt beside the NAME.want it must give),
 // hostile buffers, and where the text is read from (the portal group's

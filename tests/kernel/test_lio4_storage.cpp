@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Backstores and LUN mapping on plain directories: argument checks, what a
 // value may never do, the order of the steps and what a failed step leaves.
 // How the kernel itself takes them is the VM suite's part.

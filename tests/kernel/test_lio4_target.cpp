@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Targets on plain files: every operation checks the record first, and the
 // teardown of a portal group unlinks links without following them.
 #include <string>

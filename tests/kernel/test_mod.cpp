@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The driver table selection and the iscsi_mod_ wrappers.
 #include "kernel/korvadm_mod.h"
 

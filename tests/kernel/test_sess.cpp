@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Session and connection records: who owns what, which records count as the
 // same, and the initiator and target comparisons the listing relies on.
 // Leaks and stale links show under the sanitizer pass.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The platform utility calls: database shortcuts on a real service, the shell
 // runner and escaping, string helpers, and queries of a fake /proc and /sys.
 #include "platform/platform_util.h"

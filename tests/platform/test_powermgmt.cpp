@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The bundled powermgmt: "-s" asks each disk of the sysinfo database with
 // hdparm -C (a stand-in first on PATH) and prints the mask of sleeping disks.
 #include <sys/wait.h>

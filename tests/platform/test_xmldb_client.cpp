@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The client library against a real xmldbd: path semantics, buffers, saved
 // and loaded files, and a service that is missing or restarts.
 #include "platform/xmldb_client.h"

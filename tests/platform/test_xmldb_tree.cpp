@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The service's tree on its own: paths, dumps and the XML file form.
 #include "platform/xmldb_tree.h"
 

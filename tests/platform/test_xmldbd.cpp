@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The xmldbd service under stress: hostile and greedy clients, concurrent
 // writers and services, crashes during saves, and its command line with the
 // xmldbc tool.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Capturing what a piece of code writes to standard output or error.
 #pragma once
 

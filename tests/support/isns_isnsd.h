@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Debian's Open-iSNS server (isnsd) as a private iSNS peer for tests.
 //
 // isnsd_server runs one isnsd in the foreground, bound to one loopback

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 #include "tests/support/isns_test_server.h"
 
 #include <netdb.h>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A scriptable iSNS server for tests: faults a real server will not produce.
 //
 // isns_fake_server listens on one loopback address (IPv4 or IPv6 text) and

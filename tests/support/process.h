@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A process a test starts (a service, a server): it never outlives the test,
 // and stopping it is bounded, so a hung child cannot hang the suite.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The temporary system root shared by every test of a process.
 #include "tests/support/sysroot.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The one temporary system root of a test process.
 //
 // The library reads NESRAD_SYSROOT once per process, so one mkdtemp

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Real xmldbd processes for tests.
 #include "tests/support/xmldbd_fixture.h"
 

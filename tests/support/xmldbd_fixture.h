@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Real xmldbd services serving the configuration (and system-information)
 // databases in the test process's system root (sysroot.h).
 //

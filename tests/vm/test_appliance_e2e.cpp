@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The whole appliance in the test VM, driven the way the management tool
 // drives it: two targets built in the real kernel and the configuration
 // database, nesrad started and stopped through the control interface, a

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The LIO driver against the real kernel target, inside the test VM
 // (scripts/vm/run boots it; tests/vm/lio_kernel.sh runs this binary there).
 // The VM has configfs and the target modules' dependencies preloaded and the

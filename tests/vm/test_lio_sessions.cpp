@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The session listing against the real kernel target, inside the test VM
 // (tests/vm/lio_sessions.sh runs this binary there). A target built by the
 // driver, a real initiator (libiscsi's iscsi-perf, copied in when the host

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The driver's backstores, LUN mapping and ACLs against the real kernel
 // target, inside the test VM (tests/vm/lio_storage.sh), judged by a real
 // initiator: libiscsi logging in over the VM's loopback as each initiator.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // nesrad end to end inside the test VM: the configuration database service
 // and a private isnsd run in the VM, targets are created in the real kernel
 // through the driver and stored in the database, and the daemon (the

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Driver records for the real-kernel suites: a target with its wanted
 // portals, and the automatic link-local address the kernel gives an
 // interface. Header-only; both VM test programs include it.

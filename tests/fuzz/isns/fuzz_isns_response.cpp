@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // libFuzzer target: arbitrary bytes as the iSNS server's response, through
 // the receive path (PDU headers, joining, the buffer limit) and the
 // registration check's walk of the attributes.

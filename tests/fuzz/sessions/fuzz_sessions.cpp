@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // libFuzzer target: arbitrary bytes as the kernel's sessions text, through
 // the session listing's parser.
 //
