@@ -225,9 +225,10 @@ TEST_F(RealMounts, MountPathAndLockStateByUuid)
         std::string path;
         w >> found >> path >> unlocked;
         char out[VOL_MNT_PATH_LEN] = "stale";
-        EXPECT_EQ(quiet([&] { return sys_raid_get_mnt_path_by_uuid(out, sizeof out, uuid.c_str()); }), found) << uuid;
+        const char *id = uuid.c_str();  // clang 14 cannot capture a structured binding
+        EXPECT_EQ(quiet([&] { return sys_raid_get_mnt_path_by_uuid(out, sizeof out, id); }), found) << uuid;
         EXPECT_EQ(out, path == "-" ? "" : path) << uuid;
-        EXPECT_EQ(quiet([&] { return sys_raid_vol_is_unlocked_by_uuid(uuid.c_str()); }), unlocked) << uuid;
+        EXPECT_EQ(quiet([&] { return sys_raid_vol_is_unlocked_by_uuid(id); }), unlocked) << uuid;
     }
     char small[8];
     EXPECT_EQ(quiet([&] { return sys_raid_get_mnt_path_by_uuid(small, sizeof small, "u-ext4"); }), 6);
