@@ -19,6 +19,7 @@ void usage(FILE *to)
 {
     std::fprintf(to,
         "usage: xmldbc [-s SOCKET | --sysinfo] COMMAND [ARG...]\n"
+        "       xmldbc --help | --version\n"
         "Reads and changes the configuration database served by xmldbd.\n"
         "\n"
         "  get PATH          print the value at PATH (empty when missing)\n"
@@ -97,6 +98,9 @@ int main(int argc, char **argv)
         std::string a = argv[i];
         if (a == "-h" || a == "--help") {
             usage(stdout);
+            return 0;
+        } else if (a == "--version") {
+            std::puts("xmldbc " KORV_VERSION);
             return 0;
         } else if (a == "--sysinfo") {
             sock = XMLDB_SOCK_SYSINFO;

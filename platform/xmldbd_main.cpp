@@ -46,6 +46,7 @@ void usage(FILE *to)
 {
     std::fprintf(to,
         "usage: xmldbd [--socket PATH] [--load FILE | --empty] [--allow-dir DIR]... [--ready-fd N]\n"
+        "       xmldbd --help | --version\n"
         "Serves one configuration database tree on a Unix socket.\n"
         "  --socket PATH     socket to serve (default %s under the system root)\n"
         "  --load FILE       the saved tree to load at start (default %s under the\n"
@@ -60,7 +61,7 @@ void usage(FILE *to)
         XMLDB_SOCK_ISCSI, kDefaultLoad, kDefaultAllowDir);
 }
 
-// 0 parsed, 1 exit successfully (help), 2 usage error.
+// 0 parsed, 1 exit successfully (help, version), 2 usage error.
 int parse_args(int argc, char **argv, Options &o)
 {
     static const option longs[] = {
@@ -70,6 +71,7 @@ int parse_args(int argc, char **argv, Options &o)
         {"allow-dir", required_argument, nullptr, 'a'},
         {"ready-fd", required_argument, nullptr, 'r'},
         {"help", no_argument, nullptr, 'h'},
+        {"version", no_argument, nullptr, 'V'},
         {nullptr, 0, nullptr, 0},
     };
     int c;
@@ -90,6 +92,7 @@ int parse_args(int argc, char **argv, Options &o)
             break;
         }
         case 'h': usage(stdout); return 1;
+        case 'V': std::puts("xmldbd " KORV_VERSION); return 1;
         default: usage(stderr); return 2;
         }
     }
