@@ -1,31 +1,37 @@
 // SPDX-License-Identifier: Apache-2.0
 // The whole appliance in the test VM, driven the way the management tool
-// drives it: two targets built in the real kernel and the configuration
-// database, nesrad started and stopped through the control interface, a
-// private isnsd, and an initiator that finds the targets through iSNS
-// (isnsadm registered as the initiator and querying as it) and then logs in
-// with CHAP and does I/O through libiscsi.
+// drives it: targets built in the real kernel and the configuration
+// database, nesrad started, signalled and stopped through the control
+// interface, a private isnsd, and open-iscsi (iscsid started by
+// appliance_e2e.sh, iscsiadm, the kernel's iscsi_tcp) finding the targets
+// through iSNS, logging in with CHAP and using the disk. With --show each
+// step prints what the server and the initiator see (scripts/demo --real-kernel).
+#include <fcntl.h>
 #include <signal.h>
 #include <unistd.h>
 
 #include <gtest/gtest.h>
-#include <iscsi/iscsi.h>
-#include <iscsi/scsi-lowlevel.h>
 
 #include <chrono>
 #include <cstdio>
 #include <cstdlib>
+#include <cstring>
+#include <filesystem>
 #include <fstream>
+#include <iostream>
 #include <iterator>
-#include <map>
+#include <set>
 #include <sstream>
 #include <string>
+#include <vector>
 
 #include "common/korvadm_nesrad_if.h"
 #include "common/korvadm_sys.h"
 #include "config/korvadm_conf.h"
 #include "config/korvadm_xmldb_conf.h"
 #include "kernel/korvadm_mod.h"
+#include "kernel/korvadm_mod_lio4.h"
+#include "kernel/korvadm_sess.h"
 #include "tests/daemon/daemon_harness.h"
 #include "tests/support/isns_isnsd.h"
 #include "tests/support/xmldbd_fixture.h"
@@ -33,14 +39,16 @@
 
 using namespace std::chrono_literals;
 using korv_test::eventually;
+using korv_test::isnsadm_rows;
+using Names = std::set<std::string>;
 
 namespace {
 
 const char *const kServer = "127.0.0.1";
-const char *const kAddress = "192.0.2.1"; // dummy0: the VM's own address
-const char *const kInitiator = "iqn.2026-01.vm:host1";
+const char *const kAddress = "192.0.2.1";  // dummy0: the VM's own address
+const char *const kInitiator = "iqn.2026-01.vm:host1";  // iscsid's name (appliance_e2e.sh)
 const char *const kUser = "korvuser", *const kSecret = "e2e-secret-42";
-const char *const kIsnsadmConf = "/tmp/initiator-isnsadm.conf";
+bool show_steps = false;
 
 std::string slurp(const std::string &path)
 {
@@ -60,117 +68,76 @@ std::string run(const std::string &cmd)
     return out;
 }
 
-std::string iqn_of(const std::string &name)
+void show(const std::string &step, const std::string &text)
 {
-    char host[128] = {}, out[CONF_GEN_IQN_LEN] = {};
-    EXPECT_EQ(sys_net_get_host_name_in_iqn_spec(host, sizeof host, 1), 0);
-    EXPECT_GT(iscsi_conf_generate_iqn(out, host, name.c_str()), 0);
+    if (show_steps)
+        std::cout << "\n==== " << step << "\n" << text << std::flush;
+}
+
+std::string joined(const Names &rows)
+{
+    std::string out;
+    for (const std::string &r : rows)
+        out += "  " + r + "\n";
     return out;
 }
 
-// What the initiator discovers: each target's name and its portal groups
-// ("address:port"), from a query sent as the initiator over TCP.
-std::map<std::string, std::string> discover()
+// The host name in IQN form: the daemon's entity identifier.
+std::string entity_id()
 {
-    std::istringstream in(run(std::string("isnsadm -c ") + kIsnsadmConf + " --query iscsi-node-type=Target"));
-    std::map<std::string, std::string> found;
-    std::string line, name, address;
-    auto value = [&] {
-        std::string v = line.substr(line.find(" = ") + 3);
-        return v.size() > 1 && v.front() == '"' ? v.substr(1, v.size() - 2) : v;
-    };
-    while (std::getline(in, line)) {
-        if (line.find("Portal group name = ") != std::string::npos)
-            name = value();
-        else if (line.find("Portal group address = ") != std::string::npos)
-            address = value();
-        else if (line.find("Portal group port = ") != std::string::npos)
-            found[name] += address + ":" + value().substr(0, value().find('/')) + " ";
-        else if (line.find("iSCSI name = ") != std::string::npos)
-            found.emplace(value(), "");
-    }
-    return found;
+    char host[128] = {};
+    EXPECT_EQ(sys_net_get_host_name_in_iqn_spec(host, sizeof host, 1), 0);
+    return host;
 }
 
-// Logs in to iqn at portal as the initiator with CHAP; writes `data` at
-// block 8 when it is not empty; returns block 8 as read back, or "" when the
-// login or a command failed.
-std::string login_and_io(const std::string &portal, const std::string &iqn, const char *secret,
-                         const std::string &data = "")
+std::string iqn_of(const std::string &name)
 {
-    iscsi_context *ctx = iscsi_create_context(kInitiator);
-    iscsi_set_targetname(ctx, iqn.c_str());
-    iscsi_set_initiator_username_pwd(ctx, kUser, secret);
-    iscsi_set_session_type(ctx, ISCSI_SESSION_NORMAL);
-    iscsi_set_noautoreconnect(ctx, 1);
-    iscsi_set_timeout(ctx, 10);
-    std::string got;
-    if (iscsi_connect_sync(ctx, portal.c_str()) == 0 && iscsi_login_sync(ctx) == 0) {
-        std::string buf = data;
-        // The first command after login may report a unit attention.
-        for (int attempt = 0; attempt < 2 && !data.empty(); attempt++) {
-            scsi_task *t = iscsi_write16_sync(ctx, 0, 8, reinterpret_cast<unsigned char *>(buf.data()), 512, 512,
-                                              0, 0, 0, 0, 0);
-            const bool good = t && t->status == SCSI_STATUS_GOOD;
-            if (t)
-                scsi_free_scsi_task(t);
-            if (good)
-                break;
-        }
-        for (int attempt = 0; attempt < 2 && got.empty(); attempt++) {
-            scsi_task *t = iscsi_read16_sync(ctx, 0, 8, 512, 512, 0, 0, 0, 0, 0);
-            if (t && t->status == SCSI_STATUS_GOOD)
-                got.assign(reinterpret_cast<char *>(t->datain.data), t->datain.size);
-            if (t)
-                scsi_free_scsi_task(t);
-        }
-        // While logged in, the kernel lists the session under the ACL.
-        const std::string info = slurp("/sys/kernel/config/target/iscsi/" + iqn + "/tpgt_1/acls/" +
-                                       kInitiator + "/info");
-        if (info.find("LIO Session ID") == std::string::npos)
-            ADD_FAILURE() << "no session under the ACL: " << info;
-        iscsi_logout_sync(ctx);
-    }
-    iscsi_destroy_context(ctx);
-    return got;
+    char out[CONF_GEN_IQN_LEN] = {};
+    EXPECT_GT(iscsi_conf_generate_iqn(out, entity_id().c_str(), name.c_str()), 0);
+    return out;
 }
 
-// A target as the management tool makes it: stored, then in the kernel with
-// a portal on the VM's address, CHAP, a fileio LUN and a read-write ACL.
-void build_target(const std::string &name, int hba)
+// A target as the management tool makes it: stored, then in the kernel and
+// enabled. With storage: portals on 192.0.2.1, [::1] and dummy0's
+// link-local address, CHAP, a fileio LUN and a read-write ACL.
+void build_target(const std::string &name, int tpgt, bool storage)
 {
-    const std::string iqn = iqn_of(name), img = "/tmp/" + name + ".img";
+    const std::string iqn = iqn_of(name), img = "/tmp/" + name + ".img", lun_name = name + "-lun";
     target_conf_t *conf = target_conf_new();
     std::snprintf(conf->name, sizeof conf->name, "%s", name.c_str());
     std::snprintf(conf->iqn, sizeof conf->iqn, "%s", iqn.c_str());
     std::snprintf(conf->chap_name, sizeof conf->chap_name, "%s", kUser);
     std::snprintf(conf->chap_pwd, sizeof conf->chap_pwd, "%s", kSecret);
-    conf->tpgt = 1;
-    conf->chap_enable = 1;
-    conf->hba_id = hba;
+    conf->tpgt = tpgt;
+    conf->chap_enable = storage;
+    conf->hba_id = tpgt;
     ASSERT_EQ(xmldb_add_new_target(conf), 0) << name;
     target_conf_free(conf);
+    vm::Target t = vm::make_target(iqn, tpgt, name);
+    ASSERT_TRUE(t);
+    ASSERT_EQ(iscsi_mod_add_target(t.get()), 0);
+    if (!storage) {
+        ASSERT_EQ(iscsi_mod_enable_target(t.get()), 0);
+        return;
+    }
     lun_conf_t *lc = lun_conf_new();
-    std::snprintf(lc->name, sizeof lc->name, "%s-lun", name.c_str());
+    std::snprintf(lc->name, sizeof lc->name, "%s", lun_name.c_str());
     std::snprintf(lc->uuid, sizeof lc->uuid, "uuid-%s", name.c_str());
     std::snprintf(lc->serial, sizeof lc->serial, "sn-%s", name.c_str());
     std::snprintf(lc->img_file, sizeof lc->img_file, "%s", img.c_str());
     lc->size = 4 << 20;
     lc->prealloc = 0;
-    const std::string lun_name = lc->name;
     ASSERT_EQ(xmldb_add_new_lun(lc), 0) << name;
     lun_conf_free(lc);
     ASSERT_EQ(xmldb_add_target_lun_map(name.c_str(), lun_name.c_str(), 0), 0);
-    if (hba == 1) { // one ACL record serves both targets
+    if (tpgt == 1) {  // one ACL record serves every target
         ASSERT_EQ(xmldb_add_acl_initiator(kInitiator, "host1"), 0);
     }
     ASSERT_EQ(xmldb_set_lun_acl(kInitiator, "host1", lun_name.c_str(), 2), 0);
 
-    vm::Target t = vm::make_target(iqn, 1, name);
-    ASSERT_TRUE(t);
     t->dataout_timeout = 5;
-    ASSERT_TRUE(vm::want_portal(t.get(), kAddress, "", 3260));
-    ASSERT_EQ(iscsi_mod_add_target(t.get()), 0);
+    ASSERT_TRUE(vm::want_portal(t.get(), kAddress, "::1", 3260));
+    ASSERT_TRUE(vm::want_portal(t.get(), "", vm::link_local_of("dummy0"), 3260, "dummy0"));
     ASSERT_EQ(iscsi_mod_set_target_ip(t.get()), 0);
     t->chap = 1;
     std::snprintf(t->chap_user, sizeof t->chap_user, "%s", kUser);
@@ -181,26 +148,175 @@ void build_target(const std::string &name, int hba)
     std::snprintf(lun->path, sizeof lun->path, "%s", img.c_str());
     std::snprintf(lun->serial, sizeof lun->serial, "sn-%s", name.c_str());
     lun->size = 4 << 20;
-    lun->hba_id = hba;
-    ASSERT_EQ(iscsi_mod_add_backstore(lun), 0);
-    ASSERT_EQ(iscsi_mod_add_lun_mapping(lun, t.get(), 0), 0);
-    ASSERT_EQ(iscsi_mod_add_acl_initiator(kInitiator, t.get()), 0);
-    iscsi_map_lun_t *map = iscsi_map_lun_new();
-    iscsi_initiator_t *init = iscsi_initiator_new();
-    iscsi_lun_acl_t *acl = iscsi_lun_acl_new();
-    map->target = t.get();
-    map->lun_num = 0;
-    std::snprintf(init->name, sizeof init->name, "%s", kInitiator);
-    acl->map_lun = map;
-    acl->initiator = init;
-    acl->access_right = 2;
-    const int rc = iscsi_mod_add_lun_acl(acl);
-    iscsi_lun_acl_free(acl);
-    iscsi_initiator_free(init);
-    iscsi_map_lun_free(map);
+    lun->hba_id = tpgt;
+    iscsi_map_lun_t map{};
+    map.target = t.get();
+    iscsi_initiator_t init{};
+    std::snprintf(init.name, sizeof init.name, "%s", kInitiator);
+    iscsi_lun_acl_t acl{};
+    acl.map_lun = &map;
+    acl.initiator = &init;
+    acl.access_right = 2;
+    EXPECT_EQ(iscsi_mod_add_backstore(lun), 0);
+    EXPECT_EQ(iscsi_mod_add_lun_mapping(lun, t.get(), 0), 0);
+    EXPECT_EQ(iscsi_mod_add_acl_initiator(kInitiator, t.get()), 0);
+    EXPECT_EQ(iscsi_mod_add_lun_acl(&acl), 0);
     iscsi_lun_free(lun);
-    ASSERT_EQ(rc, 0);
     ASSERT_EQ(iscsi_mod_enable_target(t.get()), 0);
+}
+
+using Tagged = std::vector<std::pair<std::string, int>>;
+
+// "iqn address port/tcp tag" for every portal the kernel reports for the
+// targets: what the server must hold as their portal groups.
+Names kernel_portal_groups(const Tagged &targets)
+{
+    Names out;
+    for (const auto &[name, tpgt] : targets) {
+        list_t ips;
+        list_init(&ips);
+        EXPECT_EQ(iscsi_mod_get_target_ip_list_in_target_parm(&ips, iqn_of(name).c_str(), tpgt), 0);
+        for (iscsi_ip_t *ip : korv::list_records<iscsi_ip_t>(&ips))
+            for (const char *addr : {ip->ipv4, ip->ipv6})
+                if (*addr)
+                    out.insert(iqn_of(name) + " " + addr + " " + std::to_string(ip->port) + "/tcp " +
+                               std::to_string(tpgt));
+        iscsi_ip_free_list(&ips);
+    }
+    return out;
+}
+
+// The server's target nodes, and the portal groups that carry the tag of
+// one of `own` (the server adds default groups with another tag for an
+// entity's portals a node has none for; those are not ours).
+Names server_view(const korv_test::isnsd_server &srv, const Tagged &own)
+{
+    Names out = isnsadm_rows(srv, "nodes", {"iSCSI name"});
+    out.erase(kInitiator);  // open-iscsi registers itself to discover
+    for (const std::string &pg :
+         isnsadm_rows(srv, "portal-groups",
+                      {"Portal group name", "Portal group address", "Portal group port", "Portal group tag"}))
+        for (const auto &[name, tag] : own)
+            if (pg.rfind(iqn_of(name) + " ", 0) == 0 && pg.substr(pg.rfind(' ') + 1) == std::to_string(tag))
+                out.insert(pg);
+    return out;
+}
+
+// The server's view as it must be: the targets' nodes, and for those with
+// their tags the portal groups of every portal the kernel reports.
+Names want_view(const Names &targets, const Tagged &tagged)
+{
+    Names out = kernel_portal_groups(tagged);
+    for (const std::string &name : targets)
+        out.insert(iqn_of(name));
+    return out;
+}
+
+// What open-iscsi discovers through the iSNS server: "portal,tag iqn" lines.
+Names discover()
+{
+    const std::string text = run(std::string("iscsiadm -m discovery -t isns -p ") + kServer + ":3205");
+    show("open-iscsi: iscsiadm -m discovery -t isns", text);
+    std::istringstream in(text);
+    Names found;
+    for (std::string line; std::getline(in, line);)
+        if (line.find(",") != std::string::npos && line.find(" iqn.") != std::string::npos)
+            found.insert(line);
+    return found;
+}
+
+Names targets_in(const Names &discovered)
+{
+    Names iqns;
+    for (const std::string &line : discovered)
+        iqns.insert(line.substr(line.find(' ') + 1));
+    return iqns;
+}
+
+// iscsiadm on iqn's node record at 192.0.2.1:3260; output and "rc=N".
+std::string node(const std::string &iqn, const std::string &args)
+{
+    return run("iscsiadm -m node -T " + iqn + " -p " + kAddress + ":3260 " + args + " 2>&1; echo rc=$?");
+}
+
+std::string login(const std::string &iqn, const std::string &secret)
+{
+    for (const std::string &s : {std::string("authmethod -v CHAP"), "username -v " + std::string(kUser), "password -v " + secret})
+        node(iqn, "-o update -n node.session.auth." + s);
+    return node(iqn, "--login");
+}
+
+// The SCSI disk of iqn's session, "" until the kernel has attached it.
+std::string disk_of(const std::string &iqn)
+{
+    namespace fs = std::filesystem;
+    std::error_code ec;
+    for (const fs::directory_entry &e : fs::directory_iterator("/sys/block", ec)) {
+        const std::string dev = fs::canonical(e.path(), ec).string();
+        const size_t at = dev.find("/session");
+        if (!ec && at != std::string::npos &&
+            slurp("/sys/class/iscsi_session/" + dev.substr(at + 1, dev.find('/', at + 1) - at - 1) +
+                  "/targetname") == iqn + "\n")
+            return "/dev/" + e.path().filename().string();
+    }
+    return "";
+}
+
+// Writes `data` (512 bytes) at block 8 of the disk, past the page cache,
+// and returns block 8 as read back ("" on an error).
+std::string disk_io(const std::string &dev, const std::string &data)
+{
+    const int fd = ::open(dev.c_str(), O_RDWR | O_DIRECT);
+    void *buf = nullptr;
+    std::string got;
+    if (fd >= 0 && ::posix_memalign(&buf, 4096, 512) == 0) {
+        std::memcpy(buf, data.data(), 512);
+        if (::pwrite(fd, buf, 512, 8 * 512) == 512 && ::pread(fd, std::memset(buf, 0, 512), 512, 8 * 512) == 512)
+            got.assign(static_cast<char *>(buf), 512);
+    }
+    std::free(buf);
+    if (fd >= 0)
+        ::close(fd);
+    return got;
+}
+
+// The driver's session listing (slot 21) of the target: per session its
+// initiator and connections ("cid@address"), flagged when it has no TSIH or
+// is not linked to the target.
+std::string listed_sessions(const std::string &iqn, int tpgt)
+{
+    vm::Target t = vm::make_target(iqn, tpgt);
+    list_t sessions, initiators;
+    list_init(&sessions);
+    list_init(&initiators);
+    std::string out = iscsi_mod_get_target_session(&sessions, &initiators, t.get()) == 0 ? "" : "failed\n";
+    for (iscsi_sess_t *s : korv::list_records<iscsi_sess_t>(&sessions)) {
+        out += s->initiator ? s->initiator->name : "(none)";
+        out += std::string(s->tsih > 0 ? "" : " no-TSIH") + (s->target_node.list == &t->sess_list ? "" : " unlinked");
+        for (iscsi_conn_t *c : korv::list_records<iscsi_conn_t>(&s->conn_list))
+            out += " " + std::to_string(c->cid) + "@" + (c->address ? c->address : "");
+        out += "\n";
+    }
+    iscsi_sess_free_list(&sessions);
+    iscsi_initiator_free_list(&initiators);
+    return out;
+}
+
+// Logs in with CHAP, writes the pattern to the disk and reads it back; the
+// listing shows the session meanwhile. Logs out.
+void use_target(const std::string &name, int tpgt, const std::string &pattern)
+{
+    const std::string iqn = iqn_of(name), in = login(iqn, kSecret);
+    show("open-iscsi: login to " + name + " with CHAP", in);
+    ASSERT_NE(in.find("successful"), std::string::npos) << in;
+    std::string dev;
+    EXPECT_TRUE(eventually([&] { return !(dev = disk_of(iqn)).empty(); }, 30s)) << run("iscsiadm -m session -P 3");
+    const std::string listed = listed_sessions(iqn, tpgt);
+    EXPECT_EQ(listed, std::string(kInitiator) + " 0@" + kAddress + "\n");
+    EXPECT_EQ(disk_io(dev, pattern), pattern) << dev;
+    EXPECT_EQ(slurp("/tmp/" + name + ".img").substr(8 * 512, 512), pattern) << "not in the backing file";
+    show("the driver's session listing of " + name + " (" + dev + " written and read back)", listed);
+    EXPECT_NE(node(iqn, "--logout").find("rc=0"), std::string::npos);
 }
 
 // Running, and not a zombie left for the VM's init to reap.
@@ -213,8 +329,9 @@ bool alive(long long pid)
 
 TEST(ApplianceInTheVm, AnInitiatorFindsTheTargetsThroughIsnsAndUsesThem)
 {
-    if (!korv_test::isnsd_available())
-        GTEST_SKIP() << "isnsd/isnsadm were not copied into the VM";
+    if (!korv_test::isnsd_available() || access("/usr/sbin/iscsiadm", X_OK) != 0)
+        GTEST_SKIP() << "isnsd, isnsadm or iscsiadm were not copied into the VM";
+    ASSERT_FALSE(vm::link_local_of("dummy0").empty()) << "dummy0 has no link-local address";
     korv_test::XmldbProcess db("/var/run/xmldb_sock_iscsi");
     db.start();
     korv_test::isnsd_server srv(kServer);
@@ -222,18 +339,12 @@ TEST(ApplianceInTheVm, AnInitiatorFindsTheTargetsThroughIsnsAndUsesThem)
     ASSERT_EQ(xmldb_set_iqn_prefix("iqn.2026-01.org.example:"), 0);
     ASSERT_EQ(iscsi_mod_select(ISCSI_MOD_TYPE_LIO), 0);
     ASSERT_EQ(iscsi_mod_start(), 0);
-    ASSERT_NO_FATAL_FAILURE(build_target("disk1", 1));
-    ASSERT_NO_FATAL_FAILURE(build_target("disk2", 2));
+    // Both on the same portals: the server takes further targets only on the
+    // first one's portals.
+    ASSERT_NO_FATAL_FAILURE(build_target("disk1", 1, true));
+    ASSERT_NO_FATAL_FAILURE(build_target("disk2", 2, true));
     const std::string disk1 = iqn_of("disk1"), disk2 = iqn_of("disk2");
-    const std::string portal = std::string(kAddress) + ":3260 ";
-
-    // The initiator as an iSNS client: registered, then querying as itself.
-    std::ofstream(kIsnsadmConf) << "SourceName = " << kInitiator << "\nServerAddress = " << kServer
-                                << "\nSecurity = 0\n";
-    const std::string reg = run(std::string("isnsadm -c ") + kIsnsadmConf +
-                                " --register entity=host1 initiator=" + kInitiator);
-    ASSERT_NE(reg.find("Successfully registered"), std::string::npos) << reg;
-    EXPECT_EQ(discover(), (std::map<std::string, std::string>{})) << "no target before the daemon runs";
+    EXPECT_EQ(discover(), Names{}) << "a target found before the daemon runs";
 
     // The management tool's start: nesrad from PATH through the shell.
     const std::string bin = korv_test::nesrad_binary();
@@ -242,36 +353,52 @@ TEST(ApplianceInTheVm, AnInitiatorFindsTheTargetsThroughIsnsAndUsesThem)
     ASSERT_EQ(isns_set_setting(1, kServer, 0), 0);
     long long pid = 0;
     EXPECT_TRUE(eventually([&] { return (pid = korv_test::stored_pid()) > 0 && alive(pid); }, 10s));
-    const std::map<std::string, std::string> both{{disk1, portal}, {disk2, portal}};
-    EXPECT_TRUE(eventually([&] { return discover() == both; }, 15s)) << srv.adm("--list nodes");
+    const Tagged tagged{{"disk1", 1}, {"disk2", 2}, {"disk3", 3}};
+    Names want = want_view({"disk1", "disk2"}, {{"disk1", 1}, {"disk2", 2}});
+    EXPECT_TRUE(eventually([&] { return server_view(srv, tagged) == want; }, 20s)) << srv.adm("--list portal-groups");
+    EXPECT_EQ(isnsadm_rows(srv, "entities", {"Entity identifier"}).count(entity_id()), 1u);
+    show("the iSNS server holds (nesrad pid " + std::to_string(pid) + ")", joined(server_view(srv, tagged)));
 
-    // Login with CHAP at the discovered portal; the pattern lands in the file.
+    const Names found = discover();
+    EXPECT_EQ(found.count(std::string(kAddress) + ":3260,1 " + disk1), 1u) << joined(found);
+    EXPECT_EQ(found.count("[::1]:3260,2 " + disk2), 1u) << joined(found);
     std::string pattern(512, '\0');
     for (size_t i = 0; i < pattern.size(); i++)
         pattern[i] = static_cast<char>("appliance"[i % 9] ^ (i / 9));
-    for (const std::string &iqn : {disk1, disk2}) {
-        const std::string at = discover()[iqn];
-        ASSERT_FALSE(at.empty()) << iqn;
-        EXPECT_EQ(login_and_io(at.substr(0, at.find(' ')), iqn, kSecret, pattern), pattern) << iqn;
-        EXPECT_EQ(login_and_io(at.substr(0, at.find(' ')), iqn, "wrong-secret-1"), "") << iqn;
-    }
-    EXPECT_EQ(slurp("/tmp/disk2.img").substr(8 * 512, 512), pattern);
+    EXPECT_NE(login(disk1, "wrong-secret-1").find("authorization failure"), std::string::npos);
+    ASSERT_NO_FATAL_FAILURE(use_target("disk1", 1, pattern));
+    ASSERT_NO_FATAL_FAILURE(use_target("disk2", 2, pattern));
 
-    // disk2 deleted in kernel and store; SIGUSR1 makes the daemon follow.
-    vm::Target gone = vm::make_target(disk2, 1);
+    // disk2 deleted, disk3 added without portals and a portal added to disk1,
+    // in kernel and store; SIGUSR1 makes the daemon follow.
+    vm::Target gone = vm::make_target(disk2, 2);
     ASSERT_EQ(iscsi_mod_del_target(gone.get()), 0);
     ASSERT_EQ(xmldb_del_target_by_name("disk2"), 0);
+    ASSERT_NO_FATAL_FAILURE(build_target("disk3", 3, false));
+    vm::Target more = vm::make_target(disk1, 1);
+    ASSERT_TRUE(vm::want_portal(more.get(), kAddress, "::1", 3260));
+    ASSERT_TRUE(vm::want_portal(more.get(), "", vm::link_local_of("dummy0"), 3260, "dummy0"));
+    ASSERT_TRUE(vm::want_portal(more.get(), "127.0.0.9", "", 3269));
+    ASSERT_EQ(lio3_set_target_ip_v2(more.get()), 0);
+    ASSERT_EQ(kernel_portal_groups({{"disk1", 1}}).count(disk1 + " 127.0.0.9 3269/tcp 1"), 1u);
     notify_isnsclient(SIGUSR1);
-    EXPECT_TRUE(eventually([&] { return discover() == std::map<std::string, std::string>{{disk1, portal}}; },
-                           15s))
-        << srv.adm("--list nodes");
-    EXPECT_EQ(login_and_io(kAddress + std::string(":3260"), disk1, kSecret), pattern);
+    want = want_view({"disk1", "disk3"}, {{"disk1", 1}, {"disk3", 3}});
+    EXPECT_TRUE(eventually([&] { return server_view(srv, tagged) == want; }, 20s))
+        << joined(server_view(srv, tagged)) << "--\n" << joined(want);
+    show("after disk2's deletion, disk3 and a new portal, and SIGUSR1", joined(server_view(srv, tagged)));
+    // disk3 is registered without its node type (no portal), so an
+    // initiator's query for targets does not return it.
+    const Names now = discover();
+    EXPECT_EQ(targets_in(now), Names{disk1}) << joined(now);
+    EXPECT_EQ(now.count("127.0.0.9:3269,1 " + disk1), 1u) << joined(now);
+    ASSERT_NO_FATAL_FAILURE(use_target("disk1", 1, pattern));
     EXPECT_EQ(korv_test::stored_pid(), pid) << "SIGUSR1 restarted the daemon";
 
     // Off: the daemon deregisters and exits, and stores pid 0.
     ASSERT_EQ(isns_set_setting(0, nullptr, 1), 0);
     EXPECT_TRUE(eventually([&] { return korv_test::stored_pid() == 0 && !alive(pid); }, 10s));
-    EXPECT_EQ(discover(), (std::map<std::string, std::string>{})) << srv.adm("--list nodes");
+    EXPECT_EQ(server_view(srv, tagged), Names{}) << srv.adm("--list nodes");
+    EXPECT_EQ(discover(), Names{});
     int enabled = -1;
     EXPECT_EQ(xmldb_get_nesrad_enable(&enabled), 0);
     EXPECT_EQ(enabled, 0);
@@ -286,4 +413,12 @@ TEST(ApplianceInTheVm, AnInitiatorFindsTheTargetsThroughIsnsAndUsesThem)
     EXPECT_EQ(iscsi_mod_stop(), 0);
 }
 
-} // namespace
+}  // namespace
+
+int main(int argc, char **argv)
+{
+    ::testing::InitGoogleTest(&argc, argv);
+    for (int i = 1; i < argc; i++)
+        show_steps |= std::strcmp(argv[i], "--show") == 0;
+    return RUN_ALL_TESTS();
+}
