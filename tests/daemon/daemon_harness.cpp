@@ -2,17 +2,13 @@
 // The appliance in a test root, the daemon as a real process, isnsadm's view.
 #include "tests/daemon/daemon_harness.h"
 
-#include <fcntl.h>
-#include <signal.h>
-#include <sys/prctl.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
-#include <cstdio>
 #include <cstdlib>
 #include <fstream>
 #include <iterator>
 #include <map>
+#include <regex>
 #include <sstream>
 
 #include <gtest/gtest.h>
@@ -72,21 +68,16 @@ std::string nesrad_test_binary() { return NESRAD_TEST_BIN; }
 std::set<std::string> isnsadm_rows(const isnsd_server &srv, const std::string &what,
                                    std::initializer_list<const char *> keys)
 {
-    // isnsadm prints "Object N:" then "  0020  iSCSI name      : ... = value".
+    // isnsadm prints "Object N:", then one "<tag and type>: <name> = <value>" line per attribute.
+    static const std::regex attribute(R"re(^.*?: (.*?) = "?(.*?)"?$)re");
     std::vector<std::map<std::string, std::string>> objects;
     std::istringstream in(srv.adm("--list " + what));
+    std::smatch m;
     for (std::string line; std::getline(in, line);) {
-        if (line.rfind("Object ", 0) == 0) {
+        if (line.rfind("Object ", 0) == 0)
             objects.emplace_back();
-            continue;
-        }
-        size_t colon = line.find(": "), eq = line.find(" = ");
-        if (objects.empty() || colon == std::string::npos || eq == std::string::npos || eq < colon)
-            continue;
-        std::string value = line.substr(eq + 3);
-        if (value.size() >= 2 && value.front() == '"' && value.back() == '"')
-            value = value.substr(1, value.size() - 2);
-        objects.back()[line.substr(colon + 2, eq - colon - 2)] = value;
+        else if (!objects.empty() && std::regex_match(line, m, attribute))
+            objects.back()[m[1]] = m[2];
     }
     std::set<std::string> rows;
     for (auto &o : objects) {
@@ -102,57 +93,20 @@ daemon_process::daemon_process(const std::string &binary, const std::string &ser
                                std::vector<std::string> wrapper)
 {
     char tmpl[] = "/tmp/nesrad-log-XXXXXX";
-    int fd = mkstemp(tmpl);
-    if (fd < 0)
-        ADD_FAILURE() << "mkstemp";
-    log_ = tmpl;
-    std::vector<std::string> words = std::move(wrapper);
-    words.push_back(binary);
-    words.push_back(server);
-    std::fflush(nullptr);
-    pid_ = fork();
-    if (pid_ == 0) {
-        prctl(PR_SET_PDEATHSIG, SIGKILL);
-        dup2(fd, STDOUT_FILENO);
-        dup2(fd, STDERR_FILENO);
-        // The daemon must start with our signals in their default state.
-        sigset_t none;
-        sigemptyset(&none);
-        sigprocmask(SIG_SETMASK, &none, nullptr);
-        close_range(3, ~0U, 0);
-        std::vector<char *> argv;
-        for (std::string &w : words)
-            argv.push_back(w.data());
-        argv.push_back(nullptr);
-        execv(argv[0], argv.data());
-        _exit(127);
-    }
+    const int fd = mkstemp(tmpl);
+    EXPECT_GE(fd, 0) << "mkstemp";
     close(fd);
+    log_ = tmpl;
+    wrapper.push_back(binary);
+    wrapper.push_back(server);
+    // Nothing of ours (the database client's connection) goes to the daemon.
+    proc_.start(wrapper, log_, [] { close_range(3, ~0U, 0); });
 }
 
 daemon_process::~daemon_process()
 {
-    if (pid_ > 0) {
-        kill(pid_, SIGKILL);
-        waitpid(pid_, nullptr, 0);
-    }
-    if (!log_.empty())
-        unlink(log_.c_str());
-}
-
-void daemon_process::signal(int sig) const
-{
-    if (pid_ > 0)
-        kill(pid_, sig);
-}
-
-int daemon_process::wait_exit(std::chrono::milliseconds limit)
-{
-    int status = 0;
-    if (pid_ <= 0 || !eventually([&] { return waitpid(pid_, &status, WNOHANG) == pid_; }, limit))
-        return -1;
-    pid_ = -1;
-    return WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
+    proc_.kill();
+    unlink(log_.c_str());
 }
 
 std::string daemon_process::output() const

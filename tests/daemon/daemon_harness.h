@@ -8,12 +8,12 @@
 
 #include <sys/types.h>
 
-#include <chrono>
 #include <initializer_list>
 #include <set>
 #include <string>
-#include <thread>
 #include <vector>
+
+#include "tests/support/process.h"
 
 namespace korv_test {
 
@@ -69,11 +69,11 @@ public:
     daemon_process(const daemon_process &) = delete;
     daemon_process &operator=(const daemon_process &) = delete;
 
-    pid_t pid() const { return pid_; }
-    void signal(int sig) const;
+    pid_t pid() const { return proc_.pid(); }
+    void signal(int sig) const { proc_.signal(sig); }
     // Exit status (or 128+signal) when the process ends within the time; -1
     // when it is still running then.
-    int wait_exit(std::chrono::milliseconds limit);
+    int wait_exit(std::chrono::milliseconds limit) { return proc_.wait(limit); }
     // Everything the daemon printed so far.
     std::string output() const;
     // Occurrences of `text` in the output.
@@ -82,19 +82,8 @@ public:
     bool wait_for(const std::string &text, std::chrono::milliseconds limit, int n = 1) const;
 
 private:
-    pid_t pid_ = -1;
+    child_process proc_;
     std::string log_;
 };
-
-// Polls pred every 50 ms until it holds or the time is over.
-template <class Pred>
-bool eventually(Pred pred, std::chrono::milliseconds limit)
-{
-    using namespace std::chrono;
-    for (auto end = steady_clock::now() + limit; !pred(); std::this_thread::sleep_for(milliseconds(50)))
-        if (steady_clock::now() >= end)
-            return false;
-    return true;
-}
 
 }  // namespace korv_test

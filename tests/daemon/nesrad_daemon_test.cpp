@@ -2,24 +2,13 @@
 // The daemon as a real process: start-up, registration, signals, server
 // faults and resources, against xmldbd in the test's root, a private isnsd
 // (or the fault server) on the test's own loopback address, and plain
-// portal directories standing for the kernel's.
-//
-// Periodic behaviour is judged on the mean spacing of several events, so a
-// loaded machine that delays one pass does not fail the test while a daemon
-// that checks twice as often or half as often still does.
-#include <signal.h>
-
+// portal directories standing for the kernel's. The program runs as process 1
+// of a PID namespace of its own (tests/support/pidns), so that the
+// management tool's "killall nesrad" can only reach the test's daemons.
 #include <unistd.h>
 
-#include <atomic>
-#include <chrono>
 #include <filesystem>
-#include <functional>
 #include <memory>
-#include <set>
-#include <string>
-#include <thread>
-#include <vector>
 
 #include <gtest/gtest.h>
 
@@ -31,15 +20,15 @@
 
 using namespace korv_test;
 using namespace std::chrono_literals;
+using ms = std::chrono::milliseconds;
 using clock_type = std::chrono::steady_clock;
 
 namespace {
 
 constexpr uint16_t ISNS_REG = 1, ISNS_QRY = 2, ISNS_DEREG = 4;
-constexpr std::chrono::milliseconds kInterval = std::chrono::seconds(kTestInterval);
+constexpr ms kInterval = std::chrono::seconds(kTestInterval);
 const std::string kEid = "nas-box1";
-
-std::vector<target_spec> three_targets() { return {{"t1", 1}, {"t2", 2}, {"t3", 3}}; }
+const std::vector<target_spec> kThreeTargets = {{"t1", 1}, {"t2", 2}, {"t3", 3}};
 
 std::set<std::string> iqns(const std::string &eid, std::initializer_list<const char *> targets)
 {
@@ -52,62 +41,18 @@ std::set<std::string> iqns(const std::string &eid, std::initializer_list<const c
 const std::set<std::string> kThree = iqns(kEid, {"t1", "t2", "t3"});
 
 std::set<std::string> node_names(const isnsd_server &srv) { return isnsadm_rows(srv, "nodes", {"iSCSI name"}); }
-
-std::set<std::string> entity_ids(const isnsd_server &srv) { return isnsadm_rows(srv, "entities", {"Entity identifier"}); }
-
-// Mean spacing of five occurrences of the event, to be compared with the interval.
-void expect_once_per_interval(const daemon_process &d, const std::string &event)
+std::set<std::string> entity_ids(const isnsd_server &srv)
 {
-    ASSERT_TRUE(d.wait_for(event, 2 * kInterval + 5s)) << d.output();
-    const auto first = clock_type::now();
-    ASSERT_TRUE(d.wait_for(event, 12 * kInterval, 5)) << d.output();
-    auto mean = (clock_type::now() - first) / 4;
-    EXPECT_GE(mean, kInterval * 3 / 4) << "faster than once per interval";
-    EXPECT_LE(mean, kInterval * 3 / 2) << "slower than once per interval";
+    return isnsadm_rows(srv, "entities", {"Entity identifier"});
 }
 
-// An appliance with its configuration service (which loads the saved
-// configuration file at every start) and host name NAS_Box1.
-class Appliance : public ::testing::Test {
-protected:
-    void SetUp() override { set_host_name("NAS_Box1"); }
+uint16_t func_of(const bytes &pdu) { return pdu.size() >= 4 ? static_cast<uint16_t>(pdu[2] << 8 | pdu[3]) : 0; }
 
-    XmldbService db_{false, SysRoot::file("/etc/NAS_CFG/config.xml")};
-};
-
-// ... and a private isnsd on the test's own address.
-class WithIsnsd : public Appliance {
-protected:
-    void SetUp() override
-    {
-        Appliance::SetUp();
-        if (!isnsd_available())
-            GTEST_SKIP() << "isnsd not installed";
-    }
-    void start_isnsd(const std::string &address, bool now = true, int period = 0)
-    {
-        srv_ = std::make_unique<isnsd_server>(address, period);
-        if (now) {
-            ASSERT_TRUE(srv_->start()) << srv_->error();
-        }
-    }
-    bool holds(const std::set<std::string> &names, std::chrono::milliseconds limit)
-    {
-        return eventually([&] { return node_names(*srv_) == names; }, limit);
-    }
-
-    std::unique_ptr<isnsd_server> srv_;
-};
-
-uint16_t func_of(const bytes &pdu)
-{
-    return pdu.size() >= 4 ? static_cast<uint16_t>(pdu[2] << 8 | pdu[3]) : 0;
-}
-
-std::vector<uint16_t> funcs(const std::vector<bytes> &reqs)
+// The function ids of the requests a fault server received.
+std::vector<uint16_t> funcs(const isns_fake_server &srv)
 {
     std::vector<uint16_t> out;
-    for (const bytes &r : reqs)
+    for (const bytes &r : srv.requests())
         out.push_back(func_of(r));
     return out;
 }
@@ -116,21 +61,47 @@ std::vector<uint16_t> funcs(const std::vector<bytes> &reqs)
 // status 3, queries find nothing, deregistrations succeed.
 isns_fake_reply refusing_server(const bytes &req)
 {
-    uint16_t func = func_of(req);
-    if (func == ISNS_REG)
-        return {isns_pdu(0x8001, 0x4c00, {0, 0, 0, 3})};
+    const uint16_t func = func_of(req);
     if (func == ISNS_QRY)
         return {isns_pdu(0x8002, 0x4c00, isns_query_rsp(0, "", {}))};
-    return {isns_pdu(0x8000 | func, 0x4c00, {0, 0, 0, 0})};
+    return {isns_pdu(0x8000 | func, 0x4c00, {0, 0, 0, func == ISNS_REG ? uint8_t{3} : uint8_t{0}})};
 }
+
+// An appliance with its configuration service (which loads the saved
+// configuration file at every start) and host name NAS_Box1; a private isnsd
+// on the test's own address when the case starts one.
+class Appliance : public ::testing::Test {
+protected:
+    void SetUp() override { set_host_name("NAS_Box1"); }
+    void start_isnsd(const std::string &address, bool now = true, int period = 0)
+    {
+        if (!isnsd_available())
+            GTEST_SKIP() << "isnsd not installed";
+        srv_ = std::make_unique<isnsd_server>(address, period);
+        if (now) {
+            ASSERT_TRUE(srv_->start()) << srv_->error();
+        }
+    }
+    bool holds(const std::set<std::string> &names, ms limit)
+    {
+        return eventually([&] { return node_names(*srv_) == names; }, limit);
+    }
+    static bool pid_stored(const daemon_process &d)
+    {
+        return eventually([&] { return stored_pid() == d.pid(); }, 5s);
+    }
+
+    XmldbService db_{false, SysRoot::file("/etc/NAS_CFG/config.xml")};
+    std::unique_ptr<isnsd_server> srv_;
+};
 
 }  // namespace
 
-/* ---- start-up ---- */
+// ---- start-up ----
 
 TEST_F(Appliance, StartUpFailuresExitWithTheirStatusAndMessages)
 {
-    store_targets(kEid, three_targets());
+    store_targets(kEid, kThreeTargets);
     struct {
         std::string arg, says, never;
         int status = 1;
@@ -163,14 +134,14 @@ TEST_F(Appliance, StartUpFailuresExitWithTheirStatusAndMessages)
     }
     db_.restart();
 
-    // The installed daemon is linked statically: its host lookup must work.
+    // The installed daemon's host lookup (also when linked statically).
     // Without targets nothing goes to that server; the daemon is killed.
     store_targets(kEid, {});
     {
         daemon_process d(nesrad_binary(), "localhost");
         ASSERT_TRUE(d.wait_for("resolve address as ", 5s)) << d.output();
         EXPECT_EQ(1, d.count("resolve address as 127.0.0.1\n") + d.count("resolve address as ::1\n")) << d.output();
-        EXPECT_TRUE(eventually([&] { return stored_pid() == d.pid(); }, 5s));
+        EXPECT_TRUE(pid_stored(d));
     }
     SysRoot::remove("/proc/sys/kernel/hostname");
     daemon_process d(nesrad_binary(), "127.20.1.1");
@@ -178,9 +149,9 @@ TEST_F(Appliance, StartUpFailuresExitWithTheirStatusAndMessages)
     EXPECT_GE(d.count("get config failed"), 1) << d.output();
 }
 
-/* ---- registration ---- */
+// ---- registration ----
 
-TEST_F(WithIsnsd, RegistersEveryTargetAndFollowsSignals)
+TEST_F(Appliance, RegistersEveryTargetAndFollowsSignals)
 {
     start_isnsd("127.20.2.1");
     std::vector<target_spec> targets = {{"t1", 1}, {"t2", 2}, {"t3", 3}, {"t4", 4}};
@@ -194,12 +165,11 @@ TEST_F(WithIsnsd, RegistersEveryTargetAndFollowsSignals)
 
     // Both portals with each target's own tag; none for t2 and t3. The groups
     // the server makes itself (tag 1) for nodes other than t1 are not ours.
-    std::set<std::string> ours;
+    std::set<std::string> ours, want;
     for (const std::string &pg : isnsadm_rows(*srv_, "portal-groups", {"Portal group name", "Portal group address",
                                                                      "Portal group port", "Portal group tag"}))
         if (pg.back() != '1' || pg.rfind(target_iqn(kEid, "t1"), 0) == 0)
             ours.insert(pg);
-    std::set<std::string> want;
     for (const char *t : {"t1", "t4"})
         for (const char *addr : {" 192.0.2.10", " 2001:db8::10"})
             want.insert(target_iqn(kEid, t) + addr + " 3260/tcp " + (t[1] == '1' ? "1" : "4"));
@@ -211,7 +181,7 @@ TEST_F(WithIsnsd, RegistersEveryTargetAndFollowsSignals)
     EXPECT_TRUE(holds(iqns(kEid, {"t1", "t2", "t4", "t5"}), 5s)) << d.output();
 
     set_host_name("NAS_Box2");
-    store_targets("nas-box2", three_targets());
+    store_targets("nas-box2", kThreeTargets);
     d.signal(SIGUSR2);
     EXPECT_TRUE(holds(iqns("nas-box2", {"t1", "t2", "t3"}), 5s)) << srv_->adm("--list nodes") << d.output();
     EXPECT_EQ(std::set<std::string>{"nas-box2"}, entity_ids(*srv_)) << "the old entity was deregistered";
@@ -231,7 +201,7 @@ TEST_F(WithIsnsd, RegistersEveryTargetAndFollowsSignals)
     ASSERT_TRUE(d3.wait_for("waiting for the running nesrad to stop", 5s)) << d3.output();
     d.signal(SIGTERM);
     EXPECT_EQ(0, d.wait_exit(5s)) << d.output();
-    EXPECT_TRUE(eventually([&] { return stored_pid() == d3.pid(); }, 5s));
+    EXPECT_TRUE(pid_stored(d3));
     EXPECT_TRUE(holds(iqns("nas-box2", {"t1", "t2", "t3"}), 5s)) << d3.output();
     d3.signal(SIGINT);
     EXPECT_EQ(0, d3.wait_exit(5s)) << d3.output();
@@ -240,10 +210,10 @@ TEST_F(WithIsnsd, RegistersEveryTargetAndFollowsSignals)
     EXPECT_EQ(0, stored_pid());
 }
 
-TEST_F(WithIsnsd, EverythingHangsOnTheFirstTarget)
+TEST_F(Appliance, EverythingHangsOnTheFirstTarget)
 {
     start_isnsd("127.20.2.3");
-    std::vector<target_spec> targets = three_targets();
+    std::vector<target_spec> targets = kThreeTargets;
     targets[0].in_kernel = false;
     store_targets(kEid, targets);
     {
@@ -257,20 +227,17 @@ TEST_F(WithIsnsd, EverythingHangsOnTheFirstTarget)
         EXPECT_TRUE(entity_ids(*srv_).empty()) << srv_->adm("--list entities");
     }
     // It has no portals: the node type is dropped, so the check keyed on
-    // type Target never finds the entity's node.
+    // type Target never finds the entity's node and registers again each time.
     targets[0] = {"t1", 1, {}};
     store_targets(kEid, targets);
     daemon_process d(nesrad_test_binary(), "127.20.2.3");
-    // "):" ends the log prefix: not the "deregister entity=" lines.
-    expect_once_per_interval(d, "):register entity=");
-    EXPECT_GE(d.count("our data on server has been delete, reinit"), 4) << d.output();
+    EXPECT_TRUE(d.wait_for("our data on server has been delete, reinit", 6 * kInterval + 10s, 4)) << d.output();
 }
 
-/* ---- signals ---- */
+// ---- signals ----
 
 TEST_F(Appliance, SignalsWaitForTheExchangeInHandAndAStopForNoMore)
 {
-    using ms = std::chrono::milliseconds;
     const bytes ok = isns_pdu(0x8001, 0x4c00, {0, 0, 0, 0});
     auto first_trickles = [&, n = std::make_shared<int>(0)](const bytes &req) {
         return func_of(req) == ISNS_REG && (*n)++ == 0 ? isns_fake_reply{ok, 4, 300} : refusing_server(req);
@@ -283,10 +250,10 @@ TEST_F(Appliance, SignalsWaitForTheExchangeInHandAndAStopForNoMore)
         size_t targets;
         std::function<isns_fake_reply(const bytes &)> reply;
         std::string binary;
-        ms quiet;                               // before the first signal
+        ms quiet;                                 // before the first signal
         std::vector<std::pair<int, ms>> signals;  // each then a pause
-        std::vector<uint16_t> want;             // every request; or, when empty, ...
-        size_t most;                            // ... at most this many, the last a deregistration
+        std::vector<uint16_t> want;               // every request; or, when empty, ...
+        size_t most;                              // ... at most this many, the last a deregistration
         ms exit_within;
     } cases[] = {
         // No targets: nothing goes out while waiting; one empty deregistration per signal.
@@ -309,7 +276,7 @@ TEST_F(Appliance, SignalsWaitForTheExchangeInHandAndAStopForNoMore)
         srv.set_handler(c.reply);
         store_targets(kEid, {eight.begin(), eight.begin() + c.targets});
         daemon_process d(c.binary, c.server);
-        ASSERT_TRUE(eventually([&] { return stored_pid() == d.pid(); }, 5s)) << d.output();
+        ASSERT_TRUE(pid_stored(d)) << d.output();
         std::this_thread::sleep_for(c.quiet);
         for (auto [sig, pause] : c.signals) {
             d.signal(sig);
@@ -318,29 +285,27 @@ TEST_F(Appliance, SignalsWaitForTheExchangeInHandAndAStopForNoMore)
         EXPECT_EQ(0, d.wait_exit(c.exit_within)) << c.server << d.output();
         EXPECT_EQ(0, stored_pid());
         // The server reads each request only when done with the one before.
-        auto done = [&] { return !srv.requests().empty() && func_of(srv.requests().back()) == ISNS_DEREG; };
-        EXPECT_TRUE(eventually(done, 13s)) << c.server;
-        std::vector<bytes> reqs = srv.requests();
+        EXPECT_TRUE(eventually([&] { return !funcs(srv).empty() && funcs(srv).back() == ISNS_DEREG; }, 13s));
         if (c.want.empty()) {
-            EXPECT_LE(reqs.size(), c.most) << c.server;
+            EXPECT_LE(funcs(srv).size(), c.most) << c.server;
         } else {
-            EXPECT_EQ(c.want, funcs(reqs)) << c.server;
+            EXPECT_EQ(c.want, funcs(srv)) << c.server;
         }
-        // Source attribute 32 of length 4, four zero bytes.
-        for (const bytes &r : c.targets ? std::vector<bytes>{} : reqs)
+        // Without targets the source is attribute 32 of length 4, four zero bytes.
+        for (const bytes &r : c.targets ? std::vector<bytes>{} : srv.requests())
             EXPECT_EQ(isns_attr_str(32, ""), bytes(r.begin() + 12, r.begin() + std::min<size_t>(24, r.size())));
     }
 }
 
-TEST_F(WithIsnsd, AStopArrivingWithAReloadIsNeverLost)
+TEST_F(Appliance, AStopArrivingWithAReloadIsNeverLost)
 {
     start_isnsd("127.20.3.8");
-    store_targets(kEid, three_targets());
+    store_targets(kEid, kThreeTargets);
     // Both arrive while the registration holds them back; SIGINT is a stop.
     for (int i = 0; i < 30; ++i) {
         const int stop = i % 2 ? SIGTERM : SIGINT;
         daemon_process d(nesrad_test_binary(), "127.20.3.8");
-        ASSERT_TRUE(eventually([&] { return stored_pid() == d.pid(); }, 5s)) << d.output();
+        ASSERT_TRUE(pid_stored(d)) << d.output();
         d.signal(i % 4 < 2 ? SIGUSR1 : stop);
         d.signal(i % 4 < 2 ? stop : SIGUSR1);
         ASSERT_EQ(0, d.wait_exit(5s)) << "run " << i << d.output();
@@ -353,24 +318,15 @@ TEST_F(WithIsnsd, AStopArrivingWithAReloadIsNeverLost)
 // at once, 30 times against a healthy and a silent server: the old daemon
 // ends, the stored pid is then the new one's, and the healthy server holds
 // the registration a moment later.
-TEST_F(WithIsnsd, RestartsAreOrdered)
+TEST_F(Appliance, RestartsAreOrdered)
 {
-    // killall hits every process of that name: the case runs again as pid 1
-    // of a PID namespace of its own, where its daemons are all there is.
-    if (getpid() != 1) {
-        if (std::system("unshare --pid --fork --mount-proc true 2>/dev/null") != 0)
-            GTEST_SKIP() << "killall needs a PID namespace of the test's own (root, unshare)";
-        const auto *t = ::testing::UnitTest::GetInstance()->current_test_info();
-        EXPECT_EQ(0, std::system(("unshare --pid --fork --mount-proc --kill-child " +
-                                  std::filesystem::read_symlink("/proc/self/exe").string() + " --gtest_filter=" +
-                                  t->test_suite_name() + "." + t->name()).c_str()));
-        return;
-    }
+    if (getpid() != 1)
+        GTEST_SKIP() << "killall needs a PID namespace of the test's own (root, unshare)";
     start_isnsd("127.20.3.9");
     isns_fake_server silent("127.20.3.10");
     ASSERT_TRUE(silent.ok()) << silent.error();
     silent.set_reply({{}, 0, 0, 1000});
-    store_targets(kEid, three_targets());
+    store_targets(kEid, kThreeTargets);
     for (const std::string server : {"127.20.3.9", "127.20.3.10"}) {
         std::unique_ptr<daemon_process> d;
         for (int i = 0; i <= 30; ++i) {
@@ -380,18 +336,18 @@ TEST_F(WithIsnsd, RestartsAreOrdered)
                 EXPECT_EQ(0, d->wait_exit(30s)) << server << " run " << i << d->output();
             }
             d = std::move(next);
-            ASSERT_TRUE(eventually([&] { return stored_pid() == d->pid(); }, 5s)) << server << " run " << i;
+            ASSERT_TRUE(pid_stored(*d)) << server << " run " << i;
             EXPECT_TRUE(server != "127.20.3.9" || holds(kThree, 5s)) << "run " << i;
         }
     }
 }
 
-/* ---- server faults ---- */
+// ---- server faults ----
 
-TEST_F(WithIsnsd, OutagesOfTheServerOrTheConfigurationServiceAreSurvived)
+TEST_F(Appliance, OutagesOfTheServerOrTheConfigurationServiceAreSurvived)
 {
     start_isnsd("127.20.4.1", false);
-    store_targets(kEid, three_targets());
+    store_targets(kEid, kThreeTargets);
     ASSERT_EQ(0, xml_write_file("/etc/NAS_CFG/config.xml")) << "what the service loads when it comes back";
     daemon_process d(nesrad_test_binary(), "127.20.4.1");
     ASSERT_TRUE(d.wait_for("server failed", kInterval + 5s)) << d.output();
@@ -417,6 +373,9 @@ TEST_F(WithIsnsd, OutagesOfTheServerOrTheConfigurationServiceAreSurvived)
     EXPECT_EQ(-1, d.wait_exit(0ms));
 }
 
+// Judged on the mean spacing of five passes, so a loaded machine that delays
+// one does not fail the test while a daemon that checks twice as often or
+// half as often still does.
 TEST_F(Appliance, RefusingServerGetsOneDeregistrationAndOneRegistrationPerInterval)
 {
     store_targets(kEid, {{"t1", 1}});
@@ -424,24 +383,27 @@ TEST_F(Appliance, RefusingServerGetsOneDeregistrationAndOneRegistrationPerInterv
     ASSERT_TRUE(srv.ok()) << srv.error();
     srv.set_handler(refusing_server);
     daemon_process d(nesrad_test_binary(), "127.20.4.3");
-    expect_once_per_interval(d, "):register entity=");
+    const std::string pass = "):register entity=";  // "):" ends the log prefix: not "deregister"
+    ASSERT_TRUE(d.wait_for(pass, 2 * kInterval + 5s)) << d.output();
+    const auto first = clock_type::now();
+    ASSERT_TRUE(d.wait_for(pass, 12 * kInterval, 5)) << d.output();
+    const auto mean = (clock_type::now() - first) / 4;
+    EXPECT_GE(mean, kInterval * 3 / 4) << "faster than once per interval";
+    EXPECT_LE(mean, kInterval * 3 / 2) << "slower than once per interval";
     // Registration, then per pass query, deregistration, registration: never
     // two checks in one pass.
-    std::vector<uint16_t> got = funcs(srv.requests());
+    const std::vector<uint16_t> got = funcs(srv);
     ASSERT_GE(got.size(), 13u);
     EXPECT_EQ(ISNS_REG, got[0]);
-    for (size_t i = 1; i + 2 < got.size(); i += 3) {
-        EXPECT_EQ((std::vector<uint16_t>{ISNS_QRY, ISNS_DEREG, ISNS_REG}),
-                  (std::vector<uint16_t>{got[i], got[i + 1], got[i + 2]}))
-            << "pass " << (i + 2) / 3;
-    }
+    for (size_t i = 1; i + 2 < got.size(); i += 3)
+        EXPECT_EQ(std::vector<uint16_t>({ISNS_QRY, ISNS_DEREG, ISNS_REG}), std::vector(&got[i], &got[i + 3])) << i;
 }
 
-TEST_F(WithIsnsd, ShortRegistrationPeriodNeverLetsTheTargetsExpire)
+TEST_F(Appliance, ShortRegistrationPeriodNeverLetsTheTargetsExpire)
 {
     // 20 s: the installed daemon's minute would lose them two times in three.
     start_isnsd("127.20.4.5", true, 20);
-    store_targets(kEid, three_targets());
+    store_targets(kEid, kThreeTargets);
     daemon_process d(nesrad_binary(), "127.20.4.5");
     ASSERT_TRUE(holds(kThree, 5s)) << d.output();
     int missing = 0;
@@ -451,42 +413,31 @@ TEST_F(WithIsnsd, ShortRegistrationPeriodNeverLetsTheTargetsExpire)
     EXPECT_EQ(0, d.count("reinit")) << d.output();
 }
 
-/* ---- resources ---- */
+// ---- resources ----
 
-TEST_F(WithIsnsd, ManyReloadsLeakNothingAndKeepTheDescriptors)
+// Leaks are caught by the sanitizer build, whose leak check at exit fails
+// the daemon's exit status.
+TEST_F(Appliance, ManyReloadsLeakNothingAndKeepTheDescriptors)
 {
     start_isnsd("127.20.5.1");
-    store_targets(kEid, three_targets());
-#ifdef KORV_SANITIZED
-    // The sanitizer's leak check runs at exit and fails the exit status.
-    std::vector<std::string> wrapper;
-    auto limit = 5s;
-#else
-    if (system("command -v valgrind >/dev/null 2>&1") != 0)
-        GTEST_SKIP() << "valgrind not installed";
-    std::vector<std::string> wrapper = {"/usr/bin/valgrind", "--leak-check=full",
-                                        "--errors-for-leak-kinds=definite,indirect",
-                                        "--error-exitcode=99", "--quiet"};
-    auto limit = 30s;
-#endif
-    daemon_process d(nesrad_test_binary(), "127.20.5.1", wrapper);
+    store_targets(kEid, kThreeTargets);
+    daemon_process d(nesrad_test_binary(), "127.20.5.1");
     const std::string last = "register iqn=" + target_iqn(kEid, "t3");
-    // Descriptors (below valgrind's own, which sit high) are counted once the
-    // pass's last exchange is surely over.
+    // Descriptors are counted once the pass's last exchange is surely over.
     auto idle_fds = [&] {
         std::this_thread::sleep_for(500ms);
         auto fds = std::filesystem::directory_iterator("/proc/" + std::to_string(d.pid()) + "/fd");
-        return std::count_if(begin(fds), end(fds), [](auto &e) { return std::stoi(e.path().filename()) < 1024; });
+        return std::distance(begin(fds), end(fds));
     };
-    ASSERT_TRUE(d.wait_for(last, limit)) << d.output();
-    int fds = idle_fds();
+    ASSERT_TRUE(d.wait_for(last, 5s)) << d.output();
+    const auto fds = idle_fds();
     ASSERT_GT(fds, 0);
     for (int i = 2; i <= 21; ++i) {
         d.signal(i % 2 ? SIGUSR1 : SIGUSR2);
-        ASSERT_TRUE(d.wait_for(last, limit, i)) << d.output();
+        ASSERT_TRUE(d.wait_for(last, 5s, i)) << d.output();
     }
     EXPECT_EQ(fds, idle_fds());
     EXPECT_EQ(kThree, node_names(*srv_));
     d.signal(SIGTERM);
-    EXPECT_EQ(0, d.wait_exit(limit)) << d.output();
+    EXPECT_EQ(0, d.wait_exit(5s)) << d.output();
 }

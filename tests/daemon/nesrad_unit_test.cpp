@@ -3,11 +3,8 @@
 // (configuration service in the test's root). Portals and what goes on the
 // wire are judged by a real server in nesrad_daemon_test.
 #include <arpa/inet.h>
-#include <sys/socket.h>
 
 #include <cstring>
-#include <string>
-#include <vector>
 
 #include <gtest/gtest.h>
 
@@ -19,8 +16,7 @@ using namespace korv_test;
 
 namespace {
 
-const std::string kEid = "nas-box1";
-
+// The list as "iqn/tpgt" entries.
 std::vector<std::string> listed()
 {
     std::vector<std::string> out;
@@ -34,42 +30,30 @@ struct NodeList : ::testing::Test {
     void TearDown() override { _iqn_clear(); }
 };
 
-class InRoot : public NodeList {
-protected:
-    void SetUp() override
-    {
-        SysRoot::path();
-        set_host_name("NAS_Box1");
-    }
-
-    XmldbService db_;
-};
-
 }  // namespace
 
 TEST_F(NodeList, KeepsOrderAndDuplicatesAndDeletesTheFirstMatch)
 {
-    nesrad_node_t *rec = reinterpret_cast<nesrad_node_t *>(1);
+    nesrad_node_t *rec = nullptr;
     EXPECT_EQ(-1, _iqn_next(nullptr, &rec)) << "empty list has no head";
-    _iqn_add("iqn.a", 1);
-    _iqn_add("iqn.b", 2);
-    _iqn_add("iqn.a", 3);
-    _iqn_add(std::string(300, 'q').c_str(), 7);  // cut to 255
-    EXPECT_EQ((std::vector<std::string>{"iqn.a/1", "iqn.b/2", "iqn.a/3", std::string(255, 'q') + "/7"}), listed());
+    const std::string longest(255, 'q');
+    for (auto [iqn, tpgt] : {std::pair{"iqn.a", 1}, {"iqn.b", 2}, {"iqn.a", 3}})
+        _iqn_add(iqn, tpgt);
+    _iqn_add((longest + "cut").c_str(), 7);
+    EXPECT_EQ((std::vector<std::string>{"iqn.a/1", "iqn.b/2", "iqn.a/3", longest + "/7"}), listed());
     EXPECT_EQ(0, _iqn_query("iqn.b"));
     EXPECT_EQ(-1, _iqn_query("iqn.c"));
     EXPECT_EQ(-1, _iqn_query(nullptr));
 
     ASSERT_EQ(0, _iqn_next("iqn.b", &rec));
     EXPECT_EQ(3, rec->tpgt) << "successor of a record";
-    EXPECT_EQ(0, _iqn_next(std::string(255, 'q').c_str(), &rec));
+    EXPECT_EQ(0, _iqn_next(longest.c_str(), &rec));
     EXPECT_EQ(nullptr, rec) << "the last record has a NULL successor";
     EXPECT_EQ(-1, _iqn_next("iqn.c", &rec));
 
-    _iqn_del("iqn.a");
-    _iqn_del("iqn.absent");
-    _iqn_del(nullptr);
-    EXPECT_EQ((std::vector<std::string>{"iqn.b/2", "iqn.a/3", std::string(255, 'q') + "/7"}), listed());
+    for (const char *gone : {"iqn.a", "iqn.absent", static_cast<const char *>(nullptr)})
+        _iqn_del(gone);
+    EXPECT_EQ((std::vector<std::string>{"iqn.b/2", "iqn.a/3", longest + "/7"}), listed());
     EXPECT_EQ(0, _iqn_clear());
     EXPECT_TRUE(listed().empty());
     EXPECT_EQ(0, _iqn_clear());
@@ -86,13 +70,11 @@ TEST(AddressText, HostNameAndIpv4Conversions)
     ASSERT_EQ(0, ipv4_text_to_bytes(b, "192.0.2.10"));
     ASSERT_EQ(1, inet_pton(AF_INET6, "::ffff:192.0.2.10", want));
     EXPECT_EQ(0, std::memcmp(want, b, 16));
-    for (const char *bad : {"1.2.3", "1.2.3.4.5", "", "1234"})
-        EXPECT_EQ(-1, ipv4_text_to_bytes(b, bad)) << bad;
-    EXPECT_EQ(-1, ipv4_text_to_bytes(b, nullptr));
+    for (const char *bad : {"1.2.3", "1.2.3.4.5", "", "1234", static_cast<const char *>(nullptr)})
+        EXPECT_EQ(-1, ipv4_text_to_bytes(b, bad)) << (bad ? bad : "NULL");
     // Each part reads like atoi, kept to its low byte without overflowing.
     ASSERT_EQ(0, ipv4_text_to_bytes(b, "65537. +2.-1.4x"));
-    EXPECT_EQ((std::vector<int>{1, 2, 255, 4}),
-              (std::vector<int>{b[12], b[13], b[14], b[15]}));
+    EXPECT_EQ((std::vector<int>{1, 2, 255, 4}), std::vector<int>(b + 12, b + 16));
 }
 
 TEST(CheckInterval, AShortRegistrationPeriodIsCheckedAtTwoThirdsOfIt)
@@ -104,12 +86,15 @@ TEST(CheckInterval, AShortRegistrationPeriodIsCheckedAtTwoThirdsOfIt)
         EXPECT_EQ(c.ms, nesrad_check_interval_ms(60, c.period)) << c.period;
 }
 
-TEST_F(InRoot, ListFollowsTheStoreAndKeepsTheIdentifierWithoutAHostName)
+TEST_F(NodeList, FollowsTheStoreAndKeepsTheIdentifierWithoutAHostName)
 {
-    store_targets(kEid, {{"t1", 5}, {"t2", 2}});
+    set_host_name("NAS_Box1");
+    XmldbService db;
+    store_targets("nas-box1", {{"t1", 5}, {"t2", 2}});
     ASSERT_EQ(0, iscsi_conf_init(&g_nesrad_conf));
     EXPECT_EQ(2, init_iqn_list());
-    EXPECT_EQ((std::vector<std::string>{target_iqn(kEid, "t1") + "/5", target_iqn(kEid, "t2") + "/2"}), listed());
+    EXPECT_EQ((std::vector<std::string>{target_iqn("nas-box1", "t1") + "/5", target_iqn("nas-box1", "t2") + "/2"}),
+              listed());
     isns_iscsi_node *node = isns_iscsi_node_new();
     EXPECT_EQ(-1, get_iscsi_node_from_mod(node, "iqn.x", -1));
     EXPECT_EQ(-1, get_iscsi_node_from_mod(node, nullptr, 1));
@@ -119,12 +104,12 @@ TEST_F(InRoot, ListFollowsTheStoreAndKeepsTheIdentifierWithoutAHostName)
     _iqn_clear();
     SysRoot::remove("/proc/sys/kernel/hostname");
     std::snprintf(isns_entity_id, sizeof isns_entity_id, "kept");
-    store_targets(kEid, {{"t1", 1}});
+    store_targets("nas-box1", {{"t1", 1}});
     EXPECT_EQ(1, init_iqn_list());
     EXPECT_EQ((std::vector<std::string>{target_iqn("kept", "t1") + "/1"}), listed());
 
     _iqn_clear();
-    store_targets(kEid, {});
+    store_targets("nas-box1", {});
     EXPECT_EQ(0, init_iqn_list());
     EXPECT_TRUE(listed().empty());
 }

@@ -1,13 +1,13 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "tests/support/capture.h"
 
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <cstdio>
-#include <cstdlib>
 
 #include <gtest/gtest.h>
+
+#include "tests/support/process.h"
 
 namespace korv_test {
 
@@ -20,20 +20,16 @@ std::string capture(std::FILE *stream, const std::function<void()> &fn)
         ADD_FAILURE() << "tmpfile failed";
         return {};
     }
-    int fd = fileno(stream);
-    int saved = dup(fd);
+    const int fd = fileno(stream), saved = dup(fd);
     dup2(fileno(tmp), fd);
     fn();
     std::fflush(stream);
     dup2(saved, fd);
     close(saved);
-
-    std::string out;
+    std::fseek(tmp, 0, SEEK_END);
+    std::string out(static_cast<size_t>(std::ftell(tmp)), '\0');
     std::rewind(tmp);
-    char buf[4096];
-    size_t n;
-    while ((n = std::fread(buf, 1, sizeof buf, tmp)) > 0)
-        out.append(buf, n);
+    out.resize(std::fread(out.data(), 1, out.size(), tmp));
     std::fclose(tmp);
     return out;
 }
@@ -44,16 +40,8 @@ std::string capture_stderr(const std::function<void()> &fn) { return capture(std
 
 int run_in_child(const std::function<int()> &fn)
 {
-    std::fflush(nullptr);
-    pid_t pid = fork();
-    if (pid == 0)
-        _exit(fn());
-    int status = 0;
-    if (pid < 0 || waitpid(pid, &status, 0) != pid)
-        return -1;
-    if (WIFSIGNALED(status))
-        return 128 + WTERMSIG(status);
-    return WEXITSTATUS(status);
+    child_process child;
+    return child.start(fn) ? child.wait(std::chrono::hours(1)) : -1;
 }
 
 }  // namespace korv_test

@@ -2,7 +2,6 @@
 #include "tests/support/isns_test_server.h"
 
 #include <netdb.h>
-#include <fcntl.h>
 #include <netinet/in.h>
 #include <poll.h>
 #include <sys/socket.h>
@@ -10,14 +9,13 @@
 
 #include <algorithm>
 #include <cerrno>
-#include <cstdlib>
 #include <cstring>
 
 namespace korv_test {
 
 namespace {
 
-/* Fills a sockaddr for an IPv4 or IPv6 text (no name lookup); 0 on failure. */
+// Fills a sockaddr for an IPv4 or IPv6 text (no name lookup); 0 on failure.
 socklen_t make_addr(const std::string &address, int port, sockaddr_storage *ss)
 {
     addrinfo hints{}, *ai = nullptr;
@@ -41,13 +39,9 @@ bytes be32(uint32_t v)
 
 isns_fake_server::isns_fake_server(const std::string &address, int port)
 {
-    sockaddr_storage ss;
+    sockaddr_storage ss{};
     const socklen_t len = make_addr(address, port, &ss);
-    if (!len) {
-        error_ = "bad address " + address;
-        return;
-    }
-    int fd = socket(ss.ss_family, SOCK_STREAM | SOCK_CLOEXEC, 0);
+    const int fd = len ? socket(ss.ss_family, SOCK_STREAM | SOCK_CLOEXEC, 0) : -1;
     int one = 1;
     setsockopt(fd, SOL_SOCKET, SO_REUSEADDR, &one, sizeof one);
     if (ss.ss_family == AF_INET6)
@@ -59,21 +53,16 @@ isns_fake_server::isns_fake_server(const std::string &address, int port)
         return;
     }
     listen_fd_ = fd;
-    if (pipe2(stop_pipe_, O_CLOEXEC) != 0)
-        std::abort();  // out of descriptors: nothing a test can do
     thread_ = std::thread([this] { serve(); });
 }
 
 isns_fake_server::~isns_fake_server()
 {
-    if (thread_.joinable()) {
-        char c = 'x';
-        (void)!write(stop_pipe_[1], &c, 1);
+    stop_ = true;
+    if (thread_.joinable())
         thread_.join();
-    }
-    for (int fd : {listen_fd_, stop_pipe_[0], stop_pipe_[1]})
-        if (fd >= 0)
-            close(fd);
+    if (listen_fd_ >= 0)
+        close(listen_fd_);
 }
 
 void isns_fake_server::set_handler(std::function<isns_fake_reply(const bytes &)> handler)
@@ -88,26 +77,22 @@ std::vector<bytes> isns_fake_server::requests() const
     return requests_;
 }
 
-bool isns_fake_server::wait_stop(int ms)
+bool isns_fake_server::wait_readable(int fd, int ms) const
 {
-    pollfd p{stop_pipe_[0], POLLIN, 0};
-    return poll(&p, 1, ms) > 0;
+    pollfd p{fd, POLLIN, 0};
+    for (int waited = 0; !stop_ && waited < ms; waited += 20)
+        if (poll(&p, 1, 20) > 0)
+            return !stop_;
+    return false;
 }
 
 void isns_fake_server::serve()
 {
-    for (;;) {
-        pollfd p[2] = {{stop_pipe_[0], POLLIN, 0}, {listen_fd_, POLLIN, 0}};
-        if (poll(p, 2, -1) < 0 && errno != EINTR)
-            return;
-        if (p[0].revents)
-            return;
-        if (p[1].revents & POLLIN) {
-            int fd = accept4(listen_fd_, nullptr, nullptr, SOCK_CLOEXEC);
-            if (fd >= 0) {
-                serve_one(fd);
-                close(fd);
-            }
+    while (!stop_) {
+        const int fd = wait_readable(listen_fd_, 100) ? accept4(listen_fd_, nullptr, nullptr, SOCK_CLOEXEC) : -1;
+        if (fd >= 0) {
+            serve_one(fd);
+            close(fd);
         }
     }
 }
@@ -117,13 +102,9 @@ void isns_fake_server::serve_one(int fd)
     // The request: 12-byte header, then the length it announces. A client
     // that sends less is answered anyway after a short wait.
     bytes req;
-    size_t want = 12;
     uint8_t buf[4096];
-    while (req.size() < want) {
-        pollfd p[2] = {{stop_pipe_[0], POLLIN, 0}, {fd, POLLIN, 0}};
-        if (poll(p, 2, 2000) <= 0 || p[0].revents)
-            break;
-        ssize_t n = recv(fd, buf, std::min(sizeof buf, want - req.size()), 0);
+    for (size_t want = 12; req.size() < want && wait_readable(fd, 2000);) {
+        const ssize_t n = recv(fd, buf, std::min(sizeof buf, want - req.size()), 0);
         if (n <= 0)
             break;
         req.insert(req.end(), buf, buf + n);
@@ -139,14 +120,13 @@ void isns_fake_server::serve_one(int fd)
     const isns_fake_reply reply = handler ? handler(req) : isns_fake_reply{};
     const size_t step = reply.chunk ? reply.chunk : reply.data.size();
     for (size_t off = 0; off < reply.data.size(); off += step) {
-        if (off && reply.chunk_gap_ms && wait_stop(reply.chunk_gap_ms))
-            return;
+        if (off)
+            wait_readable(-1, reply.chunk_gap_ms);
         const size_t n = std::min(step, reply.data.size() - off);
-        if (send(fd, reply.data.data() + off, n, MSG_NOSIGNAL) != static_cast<ssize_t>(n))
+        if (stop_ || send(fd, reply.data.data() + off, n, MSG_NOSIGNAL) != static_cast<ssize_t>(n))
             return;
     }
-    if (reply.hold_ms)
-        wait_stop(reply.hold_ms);
+    wait_readable(-1, reply.hold_ms);
 }
 
 // Sized once and filled in place: growing vectors here trips GCC 12's
@@ -200,7 +180,7 @@ bytes operator+(bytes a, const bytes &b)
 
 bool tcp_port_open(const std::string &address, int port)
 {
-    sockaddr_storage ss;
+    sockaddr_storage ss{};
     const socklen_t len = make_addr(address, port, &ss);
     const int fd = len ? socket(ss.ss_family, SOCK_STREAM | SOCK_CLOEXEC, 0) : -1;
     const bool open = fd >= 0 && connect(fd, reinterpret_cast<sockaddr *>(&ss), len) == 0;

@@ -57,10 +57,12 @@ public:
 private:
     void serve();
     void serve_one(int fd);
-    bool wait_stop(int ms);  // true when asked to stop
+    // Up to ms for fd to turn readable (-1: just the wait); false on
+    // time-out or once asked to stop.
+    bool wait_readable(int fd, int ms) const;
 
     int listen_fd_ = -1;
-    int stop_pipe_[2] = {-1, -1};
+    std::atomic<bool> stop_{false};
     std::string error_;
     mutable std::mutex mu_;
     std::function<isns_fake_reply(const bytes &)> handler_;

@@ -1,15 +1,28 @@
 // SPDX-License-Identifier: Apache-2.0
-// A process a test starts (a service, a server): it never outlives the test,
-// and stopping it is bounded, so a hung child cannot hang the suite.
+// Processes a test starts (services, servers, the daemon): they never outlive
+// the test, and every wait is bounded, so a hung child cannot hang the suite.
 #pragma once
 
 #include <sys/types.h>
 
+#include <chrono>
 #include <functional>
 #include <string>
+#include <thread>
 #include <vector>
 
 namespace korv_test {
+
+// Polls pred every 20 ms until it holds (true) or the time is over (false).
+template <class Pred>
+bool eventually(Pred pred, std::chrono::milliseconds limit)
+{
+    using namespace std::chrono;
+    for (auto end = steady_clock::now() + limit; !pred(); std::this_thread::sleep_for(milliseconds(20)))
+        if (steady_clock::now() >= end)
+            return false;
+    return true;
+}
 
 class child_process {
 public:
@@ -18,20 +31,32 @@ public:
     child_process(const child_process &) = delete;
     child_process &operator=(const child_process &) = delete;
 
-    // Forks and executes argv[0] with argv; `prepare` runs in the child just
-    // before (redirections). False when the fork fails.
-    bool start(std::vector<std::string> argv, const std::function<void()> &prepare = {});
-    // SIGTERM, then SIGKILL after about 5 s. The exit status (128+N when
-    // killed by signal N), or -1 when it was not running.
+    // Forks and runs body in the child, which exits with its result. The
+    // child starts with no signal blocked and dies with the test. False when
+    // the fork fails.
+    bool start(const std::function<int()> &body);
+    // Executes argv[0] with argv; `prepare` runs in the child just before
+    // (redirections); log, when given, receives standard output and error.
+    bool start(std::vector<std::string> argv, const std::string &log = {},
+               const std::function<void()> &prepare = {});
+    // The exit status (128+N when killed by signal N) once the process has
+    // ended within the limit; -1 when it is still running then, or was not.
+    int wait(std::chrono::milliseconds limit);
+    // SIGTERM, then SIGKILL after 5 s; the exit status, or -1 when it was not running.
     int stop();
     // SIGKILL and reap, as a crash would.
     void kill();
+    void signal(int sig) const;
     // False (and reaped) once the process has exited.
-    bool running();
+    bool running() { return wait(std::chrono::milliseconds(0)) < 0 && pid_ > 0; }
     pid_t pid() const { return pid_; }
 
 private:
     pid_t pid_ = -1;
 };
+
+// Runs cmd through the shell; returns its standard output (each line ended by
+// '\n') and stores its exit status in *status when asked for.
+std::string run_shell(const std::string &cmd, int *status = nullptr);
 
 }  // namespace korv_test

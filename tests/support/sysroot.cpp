@@ -72,25 +72,16 @@ std::string SysRoot::read(const std::string &abs) { return read_at(file(abs)); }
 void SysRoot::mkdirs(const std::string &abs) { mkdirs_at(file(abs)); }
 void SysRoot::remove(const std::string &abs) { fs::remove_all(file(abs), ec_ignored); }
 
-void SysRoot::clear()
-{
-    for (const auto &entry : fs::directory_iterator(path(), ec_ignored))
-        fs::remove_all(entry.path(), ec_ignored);
-}
-
 void SysRootTest::SetUp()
 {
-    SysRoot::clear();
+    for (const auto &entry : fs::directory_iterator(SysRoot::path(), ec_ignored))
+        fs::remove_all(entry.path(), ec_ignored);
     g_korv_debug_level = 0;
 }
 
 void SysRootTest::mkdirs(const std::string &path) { mkdirs_at(path); }
 void SysRootTest::write_file(const std::string &path, const std::string &text) { write_at(path, text); }
 std::string SysRootTest::read_file(const std::string &path) { return read_at(path); }
-
-bool SysRootTest::exists(const std::string &path)
-{
-    return fs::exists(fs::symlink_status(path, ec_ignored));
-}
+bool SysRootTest::exists(const std::string &path) { return fs::exists(fs::symlink_status(path, ec_ignored)); }
 
 }  // namespace korv_test

@@ -30,8 +30,6 @@ public:
     static void mkdirs(const std::string &abs);
     // Removes root + abs recursively (nothing when absent).
     static void remove(const std::string &abs);
-    // Empties the root.
-    static void clear();
 };
 
 // A test whose every case starts from an emptied root and debug level 0.

@@ -2,20 +2,16 @@
 // Real xmldbd processes for tests.
 #include "tests/support/xmldbd_fixture.h"
 
-#include "platform/xmldbc.h"
-
-#include <cerrno>
-#include <cstring>
 #include <fcntl.h>
 #include <poll.h>
-#include <stdexcept>
 #include <unistd.h>
-#include <vector>
 
-#ifndef KORV_XMLDBD_PATH
+#include <stdexcept>
+
+#include "platform/xmldbc.h"
+
+#ifndef KORV_XMLDBD_PATH  // built against the appliance's platform: no service of ours
 #define KORV_XMLDBD_PATH "xmldbd"
-#endif
-#ifndef KORV_XMLDBC_PATH
 #define KORV_XMLDBC_PATH "xmldbc"
 #endif
 
@@ -24,16 +20,10 @@ namespace korv_test {
 std::string xmldbd_binary() { return KORV_XMLDBD_PATH; }
 std::string xmldbc_binary() { return KORV_XMLDBC_PATH; }
 
-XmldbProcess::XmldbProcess(std::string socket, std::vector<std::string> options)
-    : socket_(std::move(socket)), options_(std::move(options))
-{
-}
-
 XmldbProcess::~XmldbProcess()
 {
     if (ready_fd_ >= 0)
         ::close(ready_fd_);
-    stop();
 }
 
 void XmldbProcess::start()
@@ -49,19 +39,13 @@ void XmldbProcess::start()
 
 void XmldbProcess::spawn()
 {
-    if (pid() > 0)
+    int p[2];
+    if (pid() > 0 || ::pipe2(p, O_CLOEXEC) != 0)
         return;
     std::vector<std::string> args = {xmldbd_binary(), "--socket", socket_, "--ready-fd", "3"};
     args.insert(args.end(), options_.begin(), options_.end());
-    int p[2];
-    if (::pipe2(p, O_CLOEXEC) != 0)
-        throw std::runtime_error("pipe: " + std::string(std::strerror(errno)));
-    proc_.start(args, [&] {
-        if (p[1] == 3)
-            ::fcntl(3, F_SETFD, 0);
-        else
-            ::dup2(p[1], 3);
-    });
+    // Descriptor 3 without close-on-exec, whichever number the pipe got.
+    proc_.start(args, {}, [&] { p[1] == 3 ? ::fcntl(3, F_SETFD, 0) : ::dup2(p[1], 3); });
     ::close(p[1]);
     ready_fd_ = p[0];
 }
@@ -70,14 +54,11 @@ bool XmldbProcess::ready()
 {
     pollfd pfd{ready_fd_, POLLIN, 0};
     char c = 0;
-    const ssize_t got = ::poll(&pfd, 1, 10000) > 0 ? ::read(ready_fd_, &c, 1) : -1;
+    const bool up = ::poll(&pfd, 1, 10000) > 0 && ::read(ready_fd_, &c, 1) == 1;
     ::close(ready_fd_);
     ready_fd_ = -1;
-    return got == 1;
+    return up;
 }
-
-void XmldbProcess::kill() { proc_.kill(); }
-int XmldbProcess::stop() { return proc_.stop(); }
 
 std::string xmldb_get(const std::string &path, int *rc)
 {
@@ -96,12 +77,6 @@ XmldbService::XmldbService(bool sysinfo, std::string load_file)
     config_.start();
     if (sysinfo)
         sysinfo_.start();
-}
-
-void XmldbService::restart()
-{
-    config_.stop();
-    config_.start();
 }
 
 }  // namespace korv_test

@@ -8,8 +8,9 @@
 // Each service starts with an empty tree, also when test cases share the root.
 #pragma once
 
-#include <string>
 #include <sys/types.h>
+
+#include <string>
 #include <vector>
 
 #include "tests/support/process.h"
@@ -28,7 +29,10 @@ inline constexpr bool kWithSysinfo = true;
 // options (by default an empty tree).
 class XmldbProcess {
 public:
-    explicit XmldbProcess(std::string socket, std::vector<std::string> options = {"--empty"});
+    explicit XmldbProcess(std::string socket, std::vector<std::string> options = {"--empty"})
+        : socket_(std::move(socket)), options_(std::move(options))
+    {
+    }
     ~XmldbProcess();
     XmldbProcess(const XmldbProcess &) = delete;
     XmldbProcess &operator=(const XmldbProcess &) = delete;
@@ -43,9 +47,9 @@ public:
     // SIGTERM and wait; the service removes its socket. Returns its exit
     // status (128+N when killed by signal N, also after the 5 s grace
     // SIGKILL), or -1 when it was not running.
-    int stop();
+    int stop() { return proc_.stop(); }
     // SIGKILL and reap, as a crash would: the socket stays behind.
-    void kill();
+    void kill() { proc_.kill(); }
     pid_t pid() const { return proc_.pid(); }
 
 private:
@@ -72,7 +76,11 @@ public:
     // A restart begins with an empty tree unless load_file was given.
     int stop() { return config_.stop(); }
     void kill() { config_.kill(); }
-    void restart();
+    void restart()
+    {
+        config_.stop();
+        config_.start();
+    }
 
 private:
     XmldbProcess config_;
