@@ -91,7 +91,10 @@ int lio3_get_module_state(void);
  * path component) or tpgt outside 0..63 answer -9989. */
 
 /* Creates the portal group with its default attributes; an existing one is
- * left untouched (0). -9973 when the group cannot be created. */
+ * left untouched (0). -9973 when the group or its state directory cannot be
+ * made; the call then removes what it made and nothing else (its group, a
+ * new state directory, the IQN directory only when it made it and no other
+ * group holds it). */
 int lio3_add_target(iscsi_target_t *target);
 /* Disables, removes portals, ACLs and LUNs, then the group and the IQN
  * directory. An absent target answers 0; any failed step -9973. */
@@ -103,7 +106,9 @@ int lio3_disable_target(iscsi_target_t *target);
  * the credentials to every ACL. -9989 for invalid CHAP settings. */
 int lio3_set_target_chap(iscsi_target_t *target);
 /* Replaces every portal with the wanted ones (IPv4 first, then IPv6);
- * creation failures are logged only. */
+ * creation failures are logged only. -9989, with nothing changed, when a
+ * wanted address or interface name would not stay inside one portal name
+ * ('/', or an interface "." or ".."); the same holds for _v2. */
 int lio3_set_target_ip(iscsi_target_t *target);
 /* Creates the wanted portals whose address is missing and removes those no
  * longer wanted, by address (ports are not compared). */

@@ -200,31 +200,13 @@ int _lio3_set_lun_acl_deny(iscsi_lun_acl_t *lun_acl)
 
 int lio3_add_lun_acl(iscsi_lun_acl_t *lun_acl)
 {
-    if (!lun_acl) {
-        DBG(0, "lun_acl is NULL");
-        return ERR_PARAM;
-    }
-    if (!lun_acl->map_lun || !lun_acl->initiator) {
-        DBG(0, "map_lun or initiator is NULL");
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(!lun_acl, "lun_acl is NULL");
+    PARAM_GUARD(!lun_acl->map_lun || !lun_acl->initiator, "map_lun or initiator is NULL");
     iscsi_target_t *target = lun_acl->map_lun->target;
-    if (!target) {
-        DBG(0, "map target is NULL");
-        return ERR_PARAM;
-    }
-    if (check_target(target) != tcheck::ok) {
-        DBG(0, "map target error");
-        return ERR_PARAM;
-    }
-    if (lun_acl->map_lun->lun_num < 0 || lun_acl->map_lun->lun_num > ISCSI_LUN_NUM_MAX) {
-        DBG(0, "map lun error");
-        return ERR_PARAM;
-    }
-    if (!initiator_ok(lun_acl->initiator->name)) {
-        DBG(0, "initiator error");
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(!target, "map target is NULL");
+    PARAM_GUARD(check_target(target) != tcheck::ok, "map target error");
+    PARAM_GUARD(lun_acl->map_lun->lun_num < 0 || lun_acl->map_lun->lun_num > ISCSI_LUN_NUM_MAX, "map lun error");
+    PARAM_GUARD(!initiator_ok(lun_acl->initiator->name), "initiator error");
     int rc;
     switch (lun_acl->access_right) {
     case RIGHT_DENY: {
@@ -252,10 +234,7 @@ int lio3_add_lun_acl(iscsi_lun_acl_t *lun_acl)
 
 int lio3_del_lun_acl(iscsi_lun_acl_t *lun_acl)
 {
-    if (!lun_acl) {
-        DBG(0, "lun_acl is NULL");
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(!lun_acl, "lun_acl is NULL");
     lun_acl->access_right = RIGHT_DENY;
     int rc = lio3_add_lun_acl(lun_acl);
     if (rc == ERR_PARAM)

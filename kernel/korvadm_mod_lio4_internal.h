@@ -180,8 +180,8 @@ int _lio3_set_target_acl_dataout_timeout(int timeout, const char *iqn, int tpgt,
  * group's acls/ or lun/ directory cannot be opened. */
 int _lio3_remove_all_acl(iscsi_target_t *target);
 int _lio3_remove_all_lun(iscsi_target_t *target);
-/* Deletes every portal group (tpgt_<n>) of target->iqn. -9973 when one could
- * not be deleted and the IQN directory remains. */
+/* Deletes every portal group (tpgt_<n>, whatever n) of target->iqn. -9973
+ * when one could not be deleted and the IQN directory remains. */
 int _lio3_remove_all_tpgt(iscsi_target_t *target);
 /* Deletes every target of the iSCSI fabric. -9973 on the first failure. */
 int _lio3_remove_all_iscsi_target(void);

@@ -57,25 +57,15 @@ int lio3_add_lun_mapping(iscsi_lun_t *lun, iscsi_target_t *target, int lun_numbe
     if (check_lun(__func__, lun, PATH) != 0)
         return ERR_PARAM;
     std::string name = field_str(lun->name);
-    if (configfs_path_exist(fileio_dir(lun->hba_id, name).c_str()) != 0) {
-        DBG(0, "the lun : %s dos not exist", name.c_str());
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(configfs_path_exist(fileio_dir(lun->hba_id, name).c_str()) != 0, "the lun : %s dos not exist",
+                name.c_str());
     CHECK_TARGET(target, "target is null", "target iqn is not given", "target tpgt is wrong: %d", target->tpgt);
-    if (configfs_path_exist(tpg_dir(target->iqn, target->tpgt).c_str()) != 0) {
-        DBG(0, "target : %s , does not exist", target->iqn);
-        return ERR_PARAM;
-    }
-    if (!lun_num_ok(lun_number)) {
-        DBG(0, "lun num is wrong: %d", lun_number);
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(configfs_path_exist(tpg_dir(target->iqn, target->tpgt).c_str()) != 0, "target : %s , does not exist",
+                target->iqn);
+    PARAM_GUARD(!lun_num_ok(lun_number), "lun num is wrong: %d", lun_number);
     if (lun->lun_num < 0)
         lun->lun_num = lun_number;
-    if (lun->lun_num != lun_number) {
-        DBG(0, "lun's lun num is not match: %d vs %d", lun->lun_num, lun_number);
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(lun->lun_num != lun_number, "lun's lun num is not match: %d vs %d", lun->lun_num, lun_number);
     if (check_path_exist(lun->path) != 0) {
         DBG(0, "file io file : %s , does not exist", lun->path);
         return ERR_BACKING_FILE_MISSING;
@@ -162,14 +152,9 @@ int lio3_del_lun_mapping(iscsi_lun_t *lun, iscsi_target_t *target)
         return ERR_BACKSTORE_MISSING;
     }
     CHECK_TARGET(target, "target is null", "target iqn is not given", "target tpgt is wrong: %d", target->tpgt);
-    if (configfs_path_exist(tpg_dir(target->iqn, target->tpgt).c_str()) != 0) {
-        DBG(0, "target : %s , does not exist", target->iqn);
-        return ERR_PARAM;
-    }
-    if (!lun_num_ok(lun->lun_num)) {
-        DBG(0, "lun num is wrong: %d", lun->lun_num);
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(configfs_path_exist(tpg_dir(target->iqn, target->tpgt).c_str()) != 0, "target : %s , does not exist",
+                target->iqn);
+    PARAM_GUARD(!lun_num_ok(lun->lun_num), "lun num is wrong: %d", lun->lun_num);
     if (configfs_path_exist(target_lun_dir(target, lun->lun_num).c_str()) != 0) {
         DBG(0, "the lun %d of target %s does not exist", lun->lun_num, target->iqn);
         return KORV_OK;

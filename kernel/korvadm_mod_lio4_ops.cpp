@@ -4,55 +4,39 @@
 
 #include "kernel/korvadm_mod_lio4_internal.h"
 
-const iscsi_mod_ops_t lio3_mod_ops = {
-    .start_module = lio3_start_module,                                       // _module.cpp
-    .stop_module = lio3_stop_module,
-    .get_module_state = lio3_get_module_state,
-    .add_target = lio3_add_target,                                           // _target.cpp
-    .del_target = lio3_del_target,
-    .enable_target = lio3_enable_target,
-    .disable_target = lio3_disable_target,
-    .set_target_chap = lio3_set_target_chap,                                 // _auth.cpp
-    .set_target_ip = lio3_set_target_ip,                                     // _portal.cpp
-    .set_target_attr_dataout_timeout = lio3_set_target_attr_dataout_timeout, // _target.cpp
-    .get_target_existing_ip_list = lio3_get_target_existing_ip_list,         // _portal.cpp
-    .add_backstore = lio3_add_backstore,                                     // _storage.cpp
-    .del_backstore = lio3_del_backstore,
-    .shutdown_backstore = lio3_shutdown_backstore,
-    .change_backstore_size = lio3_change_backstore_size,
-    .add_lun_mapping = lio3_add_lun_mapping,                                 // _lun.cpp
-    .del_lun_mapping = lio3_del_lun_mapping,
-    .add_acl_initiator = lio3_add_acl_initiator,                             // _acl.cpp
-    .del_acl_initiator = lio3_del_acl_initiator,
-    .add_lun_acl = lio3_add_lun_acl,
-    .del_lun_acl = lio3_del_lun_acl,
-    .get_target_session = lio3_get_target_session,                           // _sessions.cpp
-};
+// Slot number and field, in table order; slot F is filled by lio3_F. One
+// list makes both the table and the checks that pin each field to its slot.
+#define LIO3_SLOTS(X)                                                        \
+    X(0, start_module)                    /* _module.cpp */                  \
+    X(1, stop_module)                                                        \
+    X(2, get_module_state)                                                   \
+    X(3, add_target)                      /* _target.cpp */                  \
+    X(4, del_target)                                                         \
+    X(5, enable_target)                                                      \
+    X(6, disable_target)                                                     \
+    X(7, set_target_chap)                 /* _auth.cpp */                    \
+    X(8, set_target_ip)                   /* _portal.cpp */                  \
+    X(9, set_target_attr_dataout_timeout) /* _target.cpp */                  \
+    X(10, get_target_existing_ip_list)    /* _portal.cpp */                  \
+    X(11, add_backstore)                  /* _storage.cpp */                 \
+    X(12, del_backstore)                                                     \
+    X(13, shutdown_backstore)                                                \
+    X(14, change_backstore_size)                                             \
+    X(15, add_lun_mapping)                /* _lun.cpp */                     \
+    X(16, del_lun_mapping)                                                   \
+    X(17, add_acl_initiator)              /* _acl.cpp */                     \
+    X(18, del_acl_initiator)                                                 \
+    X(19, add_lun_acl)                                                       \
+    X(20, del_lun_acl)                                                       \
+    X(21, get_target_session)             /* _sessions.cpp */
+
+#define FILL(n, field) .field = lio3_##field,
+const iscsi_mod_ops_t lio3_mod_ops = {LIO3_SLOTS(FILL)};
+#undef FILL
 
 // The slot numbers are the table's contract: a field moved in the struct
 // must not compile.
-#define SLOT(field, n) static_assert(offsetof(iscsi_mod_ops_t, field) == (n) * sizeof(void *), #field)
-SLOT(start_module, 0);
-SLOT(stop_module, 1);
-SLOT(get_module_state, 2);
-SLOT(add_target, 3);
-SLOT(del_target, 4);
-SLOT(enable_target, 5);
-SLOT(disable_target, 6);
-SLOT(set_target_chap, 7);
-SLOT(set_target_ip, 8);
-SLOT(set_target_attr_dataout_timeout, 9);
-SLOT(get_target_existing_ip_list, 10);
-SLOT(add_backstore, 11);
-SLOT(del_backstore, 12);
-SLOT(shutdown_backstore, 13);
-SLOT(change_backstore_size, 14);
-SLOT(add_lun_mapping, 15);
-SLOT(del_lun_mapping, 16);
-SLOT(add_acl_initiator, 17);
-SLOT(del_acl_initiator, 18);
-SLOT(add_lun_acl, 19);
-SLOT(del_lun_acl, 20);
-SLOT(get_target_session, 21);
-#undef SLOT
+#define PIN(n, field) static_assert(offsetof(iscsi_mod_ops_t, field) == (n) * sizeof(void *), #field);
+LIO3_SLOTS(PIN)
+#undef PIN
 static_assert(sizeof(iscsi_mod_ops_t) == 22 * sizeof(void *), "the driver table has 22 slots");

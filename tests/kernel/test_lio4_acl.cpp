@@ -4,6 +4,7 @@
 // deny, and what a failed step leaves behind.
 #include <unistd.h>
 
+#include <cstdio>
 #include <string>
 
 #include <gtest/gtest.h>
@@ -23,20 +24,15 @@ protected:
         SampleTree::SetUp();
         load_tree("tpg_storage.tree");
         tpg = at(TPG);
-        map = {};
-        map.target = &target;
+        mkdirs(tpg + "/lun/lun_3");
+        map = {-1, &target, nullptr, {}};
         init = {};
         set(init.name, I1);
-        acl = {};
-        acl.map_lun = &map;
-        acl.initiator = &init;
-        mkdirs(tpg + "/lun/lun_3");
     }
-    // Applies `right` to LUN n for the initiator.
-    int apply(int n, int right)
+    int apply(int n, int right)  // right to LUN n for the initiator
     {
         map.lun_num = n;
-        acl.access_right = right;
+        acl = {&map, &init, right, {}};
         return lio3_add_lun_acl(&acl);
     }
     std::string tpg;
@@ -47,34 +43,29 @@ protected:
 
 TEST_F(Lio4Acl, NodesAreOneComponentUnderAnExistingPortalGroup)
 {
-    for (const char *bad : {"", "a/b", "..", "."}) {
+    for (const char *bad : {"", "a/b", "..", ".", "../../../../../../CANARY"}) {
         EXPECT_EQ(lio3_add_acl_initiator(bad, &target), ERR_PARAM) << bad;
         EXPECT_EQ(lio3_del_acl_initiator(bad, &target), ERR_PARAM) << bad;
     }
-    EXPECT_EQ(lio3_add_acl_initiator(nullptr, &target), ERR_PARAM);
-    EXPECT_EQ(lio3_add_acl_initiator("../../../../../../CANARY", &target), ERR_PARAM);
-    EXPECT_FALSE(exists(at("/CANARY")) || exists(tpg + "/CANARY"));
-
+    EXPECT_FALSE(exists(at("/CANARY")));
     EXPECT_EQ(lio3_add_acl_initiator("default_policy", &target), 0);
     EXPECT_FALSE(exists(tpg + "/acls/default_policy"));
-    EXPECT_EQ(lio3_del_acl_initiator("default_policy", &target), 0);
 
     // The node gets the target's CHAP credentials and data-out time-out.
+    const std::string i2 = tpg + "/acls/iqn.2026-01.test:i2";
     target.chap = 1;
     set(target.chap_user, "user");
     set(target.chap_pass, "pa$(touch x)ss12");
     target.dataout_timeout = 7;
-    mkdirs(tpg + "/acls/iqn.2026-01.test:i2/auth");
-    mkdirs(tpg + "/acls/iqn.2026-01.test:i2/attrib");
+    mkdirs(i2 + "/auth");
+    mkdirs(i2 + "/attrib");
     ASSERT_EQ(lio3_add_acl_initiator("iqn.2026-01.test:i2", &target), 0);
-    EXPECT_EQ(read_file(tpg + "/acls/iqn.2026-01.test:i2/auth/password"), "pa$(touch x)ss12");
-    EXPECT_EQ(read_file(tpg + "/acls/iqn.2026-01.test:i2/attrib/dataout_timeout"), "7");
+    EXPECT_EQ(read_file(i2 + "/auth/password"), "pa$(touch x)ss12");
+    EXPECT_EQ(read_file(i2 + "/attrib/dataout_timeout"), "7");
     ASSERT_EQ(lio3_del_acl_initiator("iqn.2026-01.test:i2", &target), 0);
-    EXPECT_FALSE(exists(tpg + "/acls/iqn.2026-01.test:i2"));
-    EXPECT_EQ(lio3_del_acl_initiator("iqn.2026-01.test:i2", &target), 0);
+    EXPECT_FALSE(exists(i2));
 
-    // A portal group that is not there is not made on the way.
-    target.tpgt = 2;
+    target.tpgt = 2;  // a portal group that is not there is not made on the way
     EXPECT_EQ(lio3_add_acl_initiator(I1.c_str(), &target), ERR_TARGET_NOT_IN_KERNEL);
     EXPECT_FALSE(exists(at("/sys/kernel/config/target/iscsi/iqn.2026-01.test:t1/tpgt_2")));
 }
@@ -90,7 +81,6 @@ TEST_F(Lio4Acl, RightsMapTheLunAndOnlyDenyTogglesTheTarget)
     EXPECT_FALSE(exists(tpg + "/param/AuthMethod")) << "read-only switched the target";
     ASSERT_EQ(apply(3, 2), 0);
     EXPECT_EQ(read_file(node + "/write_protect"), "0");
-
     EXPECT_EQ(apply(3, 3), ERR_PARAM);
     EXPECT_EQ(apply(256, 1), ERR_PARAM);
     set(init.name, "../i");
@@ -102,22 +92,17 @@ TEST_F(Lio4Acl, RightsMapTheLunAndOnlyDenyTogglesTheTarget)
     // Deny: off, unmapped, on again (the switch is rewritten with AuthMethod).
     std::remove((node + "/write_protect").c_str());  // the kernel's, gone with its group
     map.lun_num = 3;
-    acl.access_right = 2;
     ASSERT_EQ(lio3_del_lun_acl(&acl), 0);
     EXPECT_EQ(acl.access_right, 0);
     EXPECT_FALSE(exists(node));
     EXPECT_EQ(read_file(tpg + "/enable"), "1");
     EXPECT_EQ(read_file(tpg + "/param/AuthMethod"), "CHAP,None");
-}
 
-TEST_F(Lio4Acl, ARightThatCannotBeSetLeavesNoLink)
-{
-    std::string node = tpg + "/acls/" + I1 + "/lun_3";
-    mkdirs(node + "/write_protect");  // refuses the write
+    // A right that cannot be set leaves no link; without an ACL node none is made.
+    mkdirs(node + "/write_protect");
     EXPECT_EQ(apply(3, 1), ERR_CONFIGFS);
     EXPECT_FALSE(exists(node + "/lun_3"));
     EXPECT_TRUE(exists(node)) << "the node was there before";
-    // Without an ACL node, none is made for the right.
     ASSERT_EQ(rename((tpg + "/acls/" + I1).c_str(), (tpg + "/acls/other").c_str()), 0);
     EXPECT_EQ(apply(3, 2), ERR_CONFIGFS);
     EXPECT_FALSE(exists(tpg + "/acls/" + I1));
