@@ -8,7 +8,6 @@
 #include <fstream>
 #include <iterator>
 #include <map>
-#include <regex>
 #include <sstream>
 
 #include <gtest/gtest.h>
@@ -69,15 +68,18 @@ std::set<std::string> isnsadm_rows(const isnsd_server &srv, const std::string &w
                                    std::initializer_list<const char *> keys)
 {
     // isnsadm prints "Object N:", then one "<tag and type>: <name> = <value>" line per attribute.
-    static const std::regex attribute(R"re(^.*?: (.*?) = "?(.*?)"?$)re");
     std::vector<std::map<std::string, std::string>> objects;
     std::istringstream in(srv.adm("--list " + what));
-    std::smatch m;
     for (std::string line; std::getline(in, line);) {
+        const size_t colon = line.find(": "), eq = line.find(" = ", colon);
         if (line.rfind("Object ", 0) == 0)
             objects.emplace_back();
-        else if (!objects.empty() && std::regex_match(line, m, attribute))
-            objects.back()[m[1]] = m[2];
+        else if (!objects.empty() && eq != std::string::npos && colon != std::string::npos) {
+            std::string value = line.substr(eq + 3);
+            if (value.size() >= 2 && value.front() == '"' && value.back() == '"')
+                value = value.substr(1, value.size() - 2);
+            objects.back()[line.substr(colon + 2, eq - colon - 2)] = value;
+        }
     }
     std::set<std::string> rows;
     for (auto &o : objects) {

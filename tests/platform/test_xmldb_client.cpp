@@ -8,9 +8,7 @@
 
 #include <chrono>
 #include <csignal>
-#include <cstring>
 #include <gtest/gtest.h>
-#include <string>
 #include <sys/stat.h>
 #include <unistd.h>
 

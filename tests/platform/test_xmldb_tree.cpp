@@ -6,7 +6,6 @@
 #include <fstream>
 #include <gtest/gtest.h>
 #include <iterator>
-#include <string>
 
 using xmldb::Tree;
 
