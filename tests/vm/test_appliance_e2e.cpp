@@ -120,6 +120,7 @@ void build_target(const std::string &name, int tpgt, bool storage)
     }
     ASSERT_EQ(xmldb_set_lun_acl(kInitiator, "host1", lun_name.c_str(), 2), 0);
 
+    t->dataout_timeout = 5;  // ACLs refuse 0
     ASSERT_TRUE(vm::want_portal(t.get(), kAddress, "::1", 3260));
     ASSERT_TRUE(vm::want_portal(t.get(), "", vm::link_local_of("dummy0"), 3260, "dummy0"));
     ASSERT_EQ(iscsi_mod_set_target_ip(t.get()), 0);
@@ -322,8 +323,7 @@ TEST(ApplianceInTheVm, AnInitiatorFindsTheTargetsThroughIsnsAndUsesThem)
 
     // disk2 deleted, disk3 added without portals and a portal added to disk1,
     // in kernel and store; SIGUSR1 makes the daemon follow.
-    vm::Target gone = vm::make_target(disk2, 2);
-    ASSERT_EQ(iscsi_mod_del_target(gone.get()), 0);
+    ASSERT_EQ(iscsi_mod_del_target(vm::make_target(disk2, 2).get()), 0);
     ASSERT_EQ(xmldb_del_target_by_name("disk2"), 0);
     ASSERT_NO_FATAL_FAILURE(build_target("disk3", 3, false));
     vm::Target more = vm::make_target(disk1, 1);
