@@ -15,9 +15,7 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
-#include <fstream>
 #include <iostream>
-#include <iterator>
 #include <sstream>
 
 #include "common/korvadm_nesrad_if.h"
@@ -34,6 +32,7 @@
 using namespace std::chrono_literals;
 using korv_test::eventually;
 using korv_test::isnsadm_rows;
+using vm::slurp;
 using Names = std::set<std::string>;
 
 namespace {
@@ -43,12 +42,6 @@ const char *const kAddress = "192.0.2.1";  // dummy0: the VM's own address
 const char *const kInitiator = "iqn.2026-01.vm:host1";  // iscsid's name (appliance_e2e.sh)
 const char *const kUser = "korvuser", *const kSecret = "e2e-secret-42";
 bool show_steps = false;
-
-std::string slurp(const std::string &path)
-{
-    std::ifstream in(path);
-    return std::string(std::istreambuf_iterator<char>(in), {});
-}
 
 std::string run(const std::string &cmd)
 {
@@ -88,7 +81,7 @@ std::string iqn_of(const std::string &name)
 // link-local address, CHAP, a fileio LUN and a read-write ACL.
 void build_target(const std::string &name, int tpgt, bool storage)
 {
-    const std::string iqn = iqn_of(name), img = "/tmp/" + name + ".img", lun_name = name + "-lun";
+    const std::string iqn = iqn_of(name);
     target_conf_t *conf = target_conf_new();
     std::snprintf(conf->name, sizeof conf->name, "%s", name.c_str());
     std::snprintf(conf->iqn, sizeof conf->iqn, "%s", iqn.c_str());
@@ -106,19 +99,19 @@ void build_target(const std::string &name, int tpgt, bool storage)
         return;
     }
     lun_conf_t *lc = lun_conf_new();
-    std::snprintf(lc->name, sizeof lc->name, "%s", lun_name.c_str());
+    std::snprintf(lc->name, sizeof lc->name, "%s", name.c_str());
     std::snprintf(lc->uuid, sizeof lc->uuid, "uuid-%s", name.c_str());
     std::snprintf(lc->serial, sizeof lc->serial, "sn-%s", name.c_str());
-    std::snprintf(lc->img_file, sizeof lc->img_file, "%s", img.c_str());
-    lc->size = 4 << 20;
+    std::snprintf(lc->img_file, sizeof lc->img_file, "/tmp/%s.img", name.c_str());
+    lc->size = 1 << 20;
     lc->prealloc = 0;
     ASSERT_EQ(xmldb_add_new_lun(lc), 0) << name;
     lun_conf_free(lc);
-    ASSERT_EQ(xmldb_add_target_lun_map(name.c_str(), lun_name.c_str(), 0), 0);
+    ASSERT_EQ(xmldb_add_target_lun_map(name.c_str(), name.c_str(), 0), 0);
     if (tpgt == 1) {  // one ACL record serves every target
         ASSERT_EQ(xmldb_add_acl_initiator(kInitiator, "host1"), 0);
     }
-    ASSERT_EQ(xmldb_set_lun_acl(kInitiator, "host1", lun_name.c_str(), 2), 0);
+    ASSERT_EQ(xmldb_set_lun_acl(kInitiator, "host1", name.c_str(), 2), 0);
 
     t->dataout_timeout = 5;  // ACLs refuse 0
     ASSERT_TRUE(vm::want_portal(t.get(), kAddress, "::1", 3260));
@@ -128,25 +121,7 @@ void build_target(const std::string &name, int tpgt, bool storage)
     std::snprintf(t->chap_user, sizeof t->chap_user, "%s", kUser);
     std::snprintf(t->chap_pass, sizeof t->chap_pass, "%s", kSecret);
     ASSERT_EQ(iscsi_mod_set_target_chap(t.get()), 0);
-    iscsi_lun_t *lun = iscsi_lun_new();
-    std::snprintf(lun->name, sizeof lun->name, "%s", lun_name.c_str());
-    std::snprintf(lun->path, sizeof lun->path, "%s", img.c_str());
-    std::snprintf(lun->serial, sizeof lun->serial, "sn-%s", name.c_str());
-    lun->size = 4 << 20;
-    lun->hba_id = tpgt;
-    iscsi_map_lun_t map{};
-    map.target = t.get();
-    iscsi_initiator_t init{};
-    std::snprintf(init.name, sizeof init.name, "%s", kInitiator);
-    iscsi_lun_acl_t acl{};
-    acl.map_lun = &map;
-    acl.initiator = &init;
-    acl.access_right = 2;
-    EXPECT_EQ(iscsi_mod_add_backstore(lun), 0);
-    EXPECT_EQ(iscsi_mod_add_lun_mapping(lun, t.get(), 0), 0);
-    EXPECT_EQ(iscsi_mod_add_acl_initiator(kInitiator, t.get()), 0);
-    EXPECT_EQ(iscsi_mod_add_lun_acl(&acl), 0);
-    iscsi_lun_free(lun);
+    ASSERT_NO_FATAL_FAILURE(vm::map_lun_for(t.get(), name, kInitiator));  // /tmp/NAME.img
     ASSERT_EQ(iscsi_mod_enable_target(t.get()), 0);
 }
 
@@ -281,7 +256,9 @@ bool alive(long long pid)
     return close != std::string::npos && stat.compare(close + 2, 1, "Z") != 0;
 }
 
-TEST(ApplianceInTheVm, AnInitiatorFindsTheTargetsThroughIsnsAndUsesThem)
+class ApplianceInTheVm : public vm::Driver {};
+
+TEST_F(ApplianceInTheVm, AnInitiatorFindsTheTargetsThroughIsnsAndUsesThem)
 {
     if (!korv_test::isnsd_available() || access("/usr/sbin/iscsiadm", X_OK) != 0)
         GTEST_SKIP() << "isnsd, isnsadm or iscsiadm were not copied into the VM";
@@ -291,8 +268,6 @@ TEST(ApplianceInTheVm, AnInitiatorFindsTheTargetsThroughIsnsAndUsesThem)
     korv_test::isnsd_server srv(kServer);
     ASSERT_TRUE(srv.start()) << srv.error();
     ASSERT_EQ(xmldb_set_iqn_prefix("iqn.2026-01.org.example:"), 0);
-    ASSERT_EQ(iscsi_mod_select(ISCSI_MOD_TYPE_LIO), 0);
-    ASSERT_EQ(iscsi_mod_start(), 0);
     // Both on the same portals: the server takes further targets only on the
     // first one's portals.
     ASSERT_NO_FATAL_FAILURE(build_target("disk1", 1, true));
@@ -352,7 +327,6 @@ TEST(ApplianceInTheVm, AnInitiatorFindsTheTargetsThroughIsnsAndUsesThem)
     char server[64] = "unchanged";
     xmldb_get_nesrad_ip(server, sizeof server);
     EXPECT_STREQ(server, "");
-    EXPECT_EQ(iscsi_mod_stop(), 0);
 }
 
 }  // namespace
