@@ -26,6 +26,7 @@
 #include "kernel/korvadm_sess.h"
 #include "tests/daemon/daemon_harness.h"
 #include "tests/support/isns_isnsd.h"
+#include "tests/support/process.h"
 #include "tests/support/xmldbd_fixture.h"
 #include "tests/vm/vm_targets.h"
 
@@ -43,16 +44,10 @@ const char *const kInitiator = "iqn.2026-01.vm:host1";  // iscsid's name (applia
 const char *const kUser = "korvuser", *const kSecret = "e2e-secret-42";
 bool show_steps = false;
 
+// Output and errors of a shell command.
 std::string run(const std::string &cmd)
 {
-    std::string out;
-    if (FILE *p = ::popen((cmd + " 2>&1").c_str(), "r")) {
-        char buf[512];
-        while (size_t n = std::fread(buf, 1, sizeof buf, p))
-            out.append(buf, n);
-        ::pclose(p);
-    }
-    return out;
+    return korv_test::run_shell(cmd + " 2>&1");
 }
 
 void show(const std::string &step, const std::string &text)
