@@ -10,12 +10,12 @@
 
 #include "common/korvadm_err.h"
 #include "kernel/korvadm_mod_lio4_internal.h"
-#include "tests/kernel/sample_tree.h"
+#include "tests/kernel/lio4_test.h"
 #include "tests/support/capture.h"
 
 namespace {
 
-using Lio4Test = korv_test::SampleTree;
+using Lio4Test = korv_test::Lio4Test;
 
 TEST_F(Lio4Test, ReadStripsOneLineEndNearTheEndAndStaysInsideTheBuffer)
 {

@@ -8,14 +8,14 @@
 
 #include "common/korvadm_err.h"
 #include "kernel/korvadm_mod_lio4_internal.h"
-#include "tests/kernel/sample_tree.h"
+#include "tests/kernel/lio4_test.h"
 #include "tests/support/capture.h"
 
 namespace {
 
 using korv_test::capture_stdout;
 
-class ModuleTest : public korv_test::SampleTree {
+class ModuleTest : public korv_test::Lio4Test {
 protected:
     void install(std::initializer_list<const char *> names)
     {

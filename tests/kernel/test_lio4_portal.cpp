@@ -1,15 +1,15 @@
 // SPDX-License-Identifier: Apache-2.0
-// Portal directory names: parsing, the kernel's list, and wanted portals
-// whose names would leave the np directory.
+// Portal directory names: parsing, and wanted portals whose names would
+// leave the np directory. The kernel's list is read in test_mod.cpp.
 #include <string>
 
 #include "common/korvadm_err.h"
 #include "kernel/korvadm_mod_lio4_internal.h"
-#include "tests/kernel/sample_tree.h"
+#include "tests/kernel/lio4_test.h"
 
 namespace {
 
-using Lio4Test = korv_test::SampleTree;
+using korv_test::Lio4Test;
 
 TEST_F(Lio4Test, PortalNamesParse)
 {
@@ -41,24 +41,6 @@ TEST_F(Lio4Test, PortalNamesParse)
     }
     EXPECT_EQ(_check_np_ip_type("10.0.0.1:3260"), IP_TYPE_V4);
     EXPECT_EQ(_check_np_ip_type("[::1]:3260"), IP_TYPE_V6);
-}
-
-TEST_F(Lio4Test, PortalListDropsNamesThatDoNotParse)
-{
-    load_tree("portals.tree");
-    list_t list;
-    list_init(&list);
-    ASSERT_EQ(lio3_get_target_existing_ip_list(&list, &target), 0);
-    EXPECT_EQ(list.count, 3);
-    iscsi_ip_t *ll = iscsi_ip_search_list_by_IPv6(&list, "fe80::1");
-    ASSERT_NE(ll, nullptr);
-    EXPECT_STREQ(ll->dev_name, "eth0");
-    EXPECT_EQ(ll->port, 3260);
-    iscsi_ip_free_list(&list);
-
-    target.tpgt = 2;  // no such portal group
-    EXPECT_EQ(lio3_get_target_existing_ip_list(&list, &target), ERR_CONFIGFS);
-    EXPECT_EQ(list.count, 0);
 }
 
 TEST_F(Lio4Test, WantedPortalsThatWouldLeaveTheirDirectoryAreRefusedWhole)

@@ -9,11 +9,9 @@
 
 #include "common/korvadm_err.h"
 #include "kernel/korvadm_mod_lio4.h"
-#include "tests/support/sysroot.h"
+#include "tests/kernel/lio4_test.h"
 
 namespace {
-
-using korv_test::SysRootTest;
 
 // The last call that reached the recording table: slot and arguments.
 struct call {
@@ -41,11 +39,11 @@ iscsi_mod_ops_t recording_table()
     return t;
 }
 
-class ModTest : public SysRootTest {
+class ModTest : public korv_test::Lio4Test {
 protected:
     void SetUp() override
     {
-        SysRootTest::SetUp();
+        Lio4Test::SetUp();
         saved_ = iscsi_mod_ops;
         rec = call{};
         list_init(&list_);
@@ -53,7 +51,7 @@ protected:
     void TearDown() override
     {
         iscsi_mod_ops = saved_;
-        SysRootTest::TearDown();
+        Lio4Test::TearDown();
     }
     const iscsi_mod_ops_t *saved_ = nullptr;
     iscsi_target_t target_{};
@@ -125,25 +123,30 @@ TEST_F(ModTest, WrappersCheckArgumentsThenPassThemThrough)
     EXPECT_EQ(rec, (call{21, &list_, &other, 0}));
 }
 
+// Through the table: the names a kernel makes, not the others (portals.tree).
 TEST_F(ModTest, PortalsOfATargetByNameAndTag)
 {
     ASSERT_EQ(iscsi_mod_select(ISCSI_MOD_TYPE_LIO), 0);
-    std::string np = at("/sys/kernel/config/target/iscsi/iqn.2026-01.test:t1/tpgt_1/np");
-    mkdirs(np + "/10.0.0.1:3260");
-    mkdirs(np + "/[2001:db8::5]:3261");
-
+    load_tree("portals.tree");
     ASSERT_EQ(iscsi_mod_get_target_ip_list_in_target_parm(&list_, "iqn.2026-01.test:t1", 1), 0);
-    ASSERT_EQ(list_.count, 2);
-    iscsi_ip_t *v6 = iscsi_ip_search_list_by_IPv6(&list_, "2001:db8::5");
-    ASSERT_TRUE(v6 && iscsi_ip_search_list_by_IPv4(&list_, "10.0.0.1"));
-    EXPECT_EQ(v6->port, 3261);
+    ASSERT_EQ(list_.count, 3);
+    iscsi_ip_t *ll = iscsi_ip_search_list_by_IPv6(&list_, "fe80::1");
+    ASSERT_TRUE(ll && iscsi_ip_search_list_by_IPv4(&list_, "10.0.0.1") &&
+                iscsi_ip_search_list_by_IPv6(&list_, "2001:db8::1"));
+    EXPECT_STREQ(ll->dev_name, "eth0");
+    EXPECT_EQ(ll->port, 3260);
 
-    // A target the kernel does not hold, and bad arguments.
-    EXPECT_EQ(iscsi_mod_get_target_ip_list_in_target_parm(&list_, "iqn.2026-01.test:t2", 1), ERR_CONFIGFS);
-    EXPECT_EQ(iscsi_mod_get_target_ip_list_in_target_parm(&list_, "", 1), ERR_PARAM);
-    EXPECT_EQ(iscsi_mod_get_target_ip_list_in_target_parm(&list_, "iqn.2026-01.test:t1", -1), ERR_PARAM);
-    EXPECT_EQ(iscsi_mod_get_target_ip_list_in_target_parm(&list_, std::string(300, 'a').c_str(), 1), ERR_PARAM);
-    EXPECT_EQ(list_.count, 2);
+    // A target or portal group the kernel does not hold, and bad arguments.
+    const struct {
+        std::string iqn;
+        int tpgt, rc;
+    } bad[] = {
+        {"iqn.2026-01.test:t2", 1, ERR_CONFIGFS}, {"iqn.2026-01.test:t1", 2, ERR_CONFIGFS}, {"", 1, ERR_PARAM},
+        {"iqn.2026-01.test:t1", -1, ERR_PARAM}, {std::string(300, 'a'), 1, ERR_PARAM},
+    };
+    for (const auto &b : bad)
+        EXPECT_EQ(iscsi_mod_get_target_ip_list_in_target_parm(&list_, b.iqn.c_str(), b.tpgt), b.rc) << b.iqn << b.tpgt;
+    EXPECT_EQ(list_.count, 3) << "a failed read adds nothing";
     iscsi_ip_free_list(&list_);
 }
 
