@@ -49,21 +49,24 @@ enum korv_rc {
  *
  *   PARAM_GUARD(!name || !name[0]);              logs "parameter error"
  *   PARAM_GUARD(!addr, "addr is NULL");          logs its own message
+ *   PARAM_GUARD_AS(func, !out);                  in a helper shared by several
+ *                                                operations: logs under func
  *
- * When the condition holds, logs at level 0 under the calling function and
- * returns ERR_PARAM (-9989) from it. At most four values may follow the
- * message. */
-#define PARAM_GUARD(...)                                                                 \
+ * When the condition holds, logs at level 0 under the calling function (or
+ * func) and returns ERR_PARAM (-9989) from it. At most four values may
+ * follow the message. */
+#define PARAM_GUARD(...) PARAM_GUARD_AS(__func__, __VA_ARGS__)
+#define PARAM_GUARD_AS(func, ...)                                                        \
     KORV_PARAM_GUARD_PICK(__VA_ARGS__, KORV_PARAM_GUARD_MSG, KORV_PARAM_GUARD_MSG, KORV_PARAM_GUARD_MSG, \
-                          KORV_PARAM_GUARD_MSG, KORV_PARAM_GUARD_MSG, KORV_PARAM_GUARD_PLAIN, )(__VA_ARGS__)
+                          KORV_PARAM_GUARD_MSG, KORV_PARAM_GUARD_MSG, KORV_PARAM_GUARD_PLAIN, )(func, __VA_ARGS__)
 #define KORV_PARAM_GUARD_PICK(a1, a2, a3, a4, a5, a6, name, ...) name
-#define KORV_PARAM_GUARD_PLAIN(refused) KORV_PARAM_GUARD_MSG(refused, "parameter error")
-#define KORV_PARAM_GUARD_MSG(refused, ...) \
-    do {                                   \
-        if (refused) {                     \
-            DBG(0, __VA_ARGS__);           \
-            return ERR_PARAM;              \
-        }                                  \
+#define KORV_PARAM_GUARD_PLAIN(func, refused) KORV_PARAM_GUARD_MSG(func, refused, "parameter error")
+#define KORV_PARAM_GUARD_MSG(func, refused, ...) \
+    do {                                         \
+        if (refused) {                           \
+            DBG_AS(func, 0, __VA_ARGS__);        \
+            return ERR_PARAM;                    \
+        }                                        \
     } while (0)
 
 /* Short English meaning of a code, for messages and tests; never NULL. */

@@ -87,32 +87,14 @@ int _xmldb_lun_acl_get_dbidx(int lun, const char *initiator)
 {
     PARAM_GUARD(!initiator || lun < 1);
     char root[kPathLen];
-    int n = 0;
-    int rc = _search_xmldb_id_entry(&n, lun_acl_root(root, lun), CONF_MAX_ACLS, "initiator", initiator);
-    if (rc == ID_ENTRY_FOUND)
-        return n;
-    if (rc == ID_ENTRY_NOT_FOUND) {
-        DBG(2, "can not find %s", initiator);
-        return ERR_NOT_FOUND;
-    }
-    DBG(0, "db failed");
-    return ERR_DB_WRITE;
+    return find_in(__func__, {lun_acl_root(root, lun), CONF_MAX_ACLS, "initiator"}, initiator);
 }
 
 int _xmldb_acl_get_mapped_lun_dbidx(int acl, const char *lun_name)
 {
     PARAM_GUARD(!lun_name || acl < 1);
     char root[kPathLen];
-    int n = 0;
-    int rc = _search_xmldb_id_entry(&n, mapped_lun_root(root, acl), CONF_MAX_LUNS, "lun_name", lun_name);
-    if (rc == ID_ENTRY_FOUND)
-        return n;
-    if (rc == ID_ENTRY_NOT_FOUND) {
-        DBG(2, "can not find %s", lun_name);
-        return ERR_NOT_FOUND;
-    }
-    DBG(0, "db failed");
-    return ERR_DB_WRITE;
+    return find_in(__func__, {mapped_lun_root(root, acl), CONF_MAX_LUNS, "lun_name"}, lun_name);
 }
 
 int _xmldb_update_current_lun_aclcnt(int lun)
@@ -183,10 +165,7 @@ namespace {
 int write_right(const char *initiator, const char *alias, const char *lun_name, int lun, int acl, int right)
 {
     const char *func = "_xmldb_set_lun_acl";
-    if (right < 0 || right > 2) {
-        DBG_AS(func, 0, "Error unknown access right = %d\n", right);
-        return ERR_PARAM;
-    }
+    PARAM_GUARD_AS(func, right < 0 || right > 2, "Error unknown access right = %d\n", right);
     const char *word = kRightWords[right];
     char root[kPathLen];
     bool k_new = false, m_new = false;
@@ -228,10 +207,7 @@ int xmldb_set_lun_acl(const char *initiator, const char *alias, const char *lun_
                           : !lun_name[0] || !fits<CONF_NAME_LEN>(lun_name) ? "lun name error"
                           : access_right < 0 || access_right > 2           ? "access right error"
                                                                            : nullptr;
-    if (invalid) {
-        DBG(0, "%s", invalid);
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(invalid, "%s", invalid);
     // The LUN before the initiator: a refused grant adds nobody.
     int lun = find_entry(__func__, kLuns, lun_name, "lun name not exist");
     if (lun < 1)
@@ -279,13 +255,7 @@ int xmldb_del_acl_initiator(const char *initiator)
                        });
     if (rc != KORV_OK)
         return rc;
-    char path[kPathLen];
-    pathf(path, sizeof path, "%s/id:%d", kAcls.root, acl);
-    if (xmldb_delete_node(path) != KORV_OK) {
-        DBG(0, "xmldb_delete_node(%s) failed", path);
-        return ERR_DB_WRITE;
-    }
-    return _xmldb_dec_acl_count();
+    return delete_entry(__func__, kAcls.root, acl, _xmldb_dec_acl_count);
 }
 
 int xmldb_remove_lun_from_all_acl(const char *lun_name)
@@ -329,26 +299,18 @@ int xmldb_remove_lun_from_all_acl(const char *lun_name)
 int xmldb_get_all_acl_initiator_conf_lite(list_t *list)
 {
     PARAM_GUARD(!list);
-    return korv::fill_and_hand_over(list, acl_initiator_conf_free_list, [&](list_t *got) {
-        return walk_list(__func__, kAcls.root, kAcls.max, kAcls.key, CONF_IQN_LEN, "get alias error",
-                         [&](int n, const char *initiator) -> int {
-                             char alias[kKeyLen] = "";
-                             char path[kPathLen];
-                             int rc = xmldb_get_cstring(alias, sizeof alias, entry_path(path, kAcls.root, n, "alias"));
-                             if (rc != KORV_OK)
-                                 return rc;
-                             acl_initiator_conf_t *conf = acl_initiator_conf_new();
-                             if (!conf) {
-                                 DBG(0, "new i_conf failed");
-                                 return ERR_NO_MEMORY;
-                             }
-                             conf->dbidx = n;
-                             korv::copy_bounded(conf->initiator, initiator);
-                             korv::copy_bounded(conf->alias, alias);
-                             list_append(&conf->node, got);
-                             return KORV_OK;
-                         });
-    });
+    static constexpr RecordKind<acl_initiator_conf_t> kind{acl_initiator_conf_new, acl_initiator_conf_free,
+                                                           acl_initiator_conf_free_list, "new i_conf failed"};
+    return read_records(__func__, list, kind, kAcls, CONF_IQN_LEN, "get alias error",
+                        [&](acl_initiator_conf_t *conf, const char *initiator) -> int {
+                            char alias[kKeyLen] = "";
+                            char path[kPathLen];
+                            int rc = xmldb_get_cstring(alias, sizeof alias,
+                                                       entry_path(path, kAcls.root, conf->dbidx, "alias"));
+                            korv::copy_bounded(conf->initiator, initiator);
+                            korv::copy_bounded(conf->alias, alias);
+                            return rc;
+                        });
 }
 
 int xmldb_get_all_lun_acl_conf_from_lun(const char *lun_name, list_t *list)
@@ -359,45 +321,35 @@ int xmldb_get_all_lun_acl_conf_from_lun(const char *lun_name, list_t *list)
         return lun;
     char root[kPathLen];
     lun_acl_root(root, lun);
-    return korv::fill_and_hand_over(list, lun_acl_conf_free_list, [&](list_t *got) {
-        return walk_list(__func__, root, CONF_MAX_ACLS, "initiator", CONF_IQN_LEN, nullptr,
-                         [&](int k, const char *initiator) -> int {
-                             char alias[kKeyLen] = "", right[kKeyLen] = "";
-                             char path[kPathLen];
-                             int rc = xmldb_get_cstring(alias, sizeof alias, entry_path(path, root, k, "alias"));
-                             if (rc != KORV_OK) {
-                                 DBG(0, "get alias error");
-                                 return rc;
-                             }
-                             rc = xmldb_get_cstring(right, sizeof right, entry_path(path, root, k, "access_right"));
-                             int parsed = rc == KORV_OK ? iscsi_conf_parse_access_right(right) : -1;
-                             if (parsed < 0) {
-                                 DBG(0, "get access right error");
-                                 return rc != KORV_OK ? rc : ERR_INT_VALUE;
-                             }
-                             lun_acl_conf_t *conf = lun_acl_conf_new();
-                             if (!conf) {
-                                 DBG(0, "new conf failed");
-                                 return ERR_NO_MEMORY;
-                             }
-                             conf->dbidx = k;
-                             korv::copy_bounded(conf->initiator, initiator);
-                             korv::copy_bounded(conf->alias, alias);
-                             conf->access_right = parsed;
-                             list_append(&conf->node, got);
-                             return KORV_OK;
-                         });
-    });
+    static constexpr RecordKind<lun_acl_conf_t> kind{lun_acl_conf_new, lun_acl_conf_free, lun_acl_conf_free_list,
+                                                     "new conf failed"};
+    return read_records(__func__, list, kind, {root, CONF_MAX_ACLS, "initiator"}, CONF_IQN_LEN, nullptr,
+                        [&](lun_acl_conf_t *conf, const char *initiator) -> int {
+                            const int k = conf->dbidx;
+                            char alias[kKeyLen] = "", right[kKeyLen] = "";
+                            char path[kPathLen];
+                            int rc = xmldb_get_cstring(alias, sizeof alias, entry_path(path, root, k, "alias"));
+                            if (rc != KORV_OK) {
+                                DBG(0, "get alias error");
+                                return rc;
+                            }
+                            rc = xmldb_get_cstring(right, sizeof right, entry_path(path, root, k, "access_right"));
+                            conf->access_right = rc == KORV_OK ? iscsi_conf_parse_access_right(right) : -1;
+                            if (conf->access_right < 0) {
+                                DBG(0, "get access right error");
+                                return rc != KORV_OK ? rc : ERR_INT_VALUE;
+                            }
+                            korv::copy_bounded(conf->initiator, initiator);
+                            korv::copy_bounded(conf->alias, alias);
+                            return KORV_OK;
+                        });
 }
 
 int xmldb_get_initiator_name_from_alias(char *buf, size_t size, const char *alias)
 {
     PARAM_GUARD(!buf || size == 0 || !alias);
     buf[0] = '\0';
-    if (!alias[0]) {
-        DBG(0, "alias is empty");
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(!alias[0], "alias is empty");
     bool found = false;
     return walk_list(__func__, kAcls.root, kAcls.max, kAcls.key, kKeyLen, nullptr,
                      [&](int n, const char *initiator) -> int {

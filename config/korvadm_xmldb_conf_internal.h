@@ -130,6 +130,17 @@ inline bool whole_read_failure(int rc)
     return rc == ERR_DB_CLIENT || rc == ERR_NO_MEMORY || rc == ERR_PARAM;
 }
 
+// A keyed list of the schema: its root, capacity and key field.
+struct Keyed {
+    const char *root;
+    int max;
+    const char *key;
+};
+inline constexpr Keyed kTargets{kTargetRoot, CONF_MAX_TARGETS, "name"};
+inline constexpr Keyed kLuns{"/iscsi/lun", CONF_MAX_LUNS, "name"};
+inline constexpr Keyed kAcls{"/iscsi/acl", CONF_MAX_ACLS, "initiator"};
+inline constexpr Keyed kSessions{"/iscsi/sess/initiator", CONF_MAX_ACLS, "name"};
+
 // Walks entries 1..max of a list up to the first empty key, calling
 // fill(n, key) for each; fill answers 0 or a code. A key too long for a
 // field of key_field bytes is a broken record and skipped, never cut (a cut
@@ -163,16 +174,43 @@ int walk_list(const char *func, const char *root, int max, const char *key, size
     return KORV_OK;
 }
 
-// A keyed list of the schema: its root, capacity and key field.
-struct Keyed {
-    const char *root;
-    int max;
-    const char *key;
+
+// One kind of record: how one is made and freed, and what a failed
+// allocation logs.
+template <class T>
+struct RecordKind {
+    T *(*make)(void);
+    void (*free)(T *);
+    void (*free_list)(list_t *);
+    const char *make_fail;
 };
-inline constexpr Keyed kTargets{kTargetRoot, CONF_MAX_TARGETS, "name"};
-inline constexpr Keyed kLuns{"/iscsi/lun", CONF_MAX_LUNS, "name"};
-inline constexpr Keyed kAcls{"/iscsi/acl", CONF_MAX_ACLS, "initiator"};
-inline constexpr Keyed kSessions{"/iscsi/sess/initiator", CONF_MAX_ACLS, "name"};
+
+// Reads the entries of list (walk_list, keys of at most key_field bytes)
+// into new records of a kind: each gets dbidx = its entry number and is
+// filled by fill(record, key), or freed and skipped when fill() fails. The
+// records go to out only when the whole read succeeds.
+template <class T, class Fill>
+int read_records(const char *func, list_t *out, const RecordKind<T> &kind, const Keyed &list, size_t key_field,
+                 const char *skip_fmt, Fill fill)
+{
+    return korv::fill_and_hand_over(out, kind.free_list, [&](list_t *got) {
+        return walk_list(func, list.root, list.max, list.key, key_field, skip_fmt, [&](int n, const char *key) -> int {
+            T *conf = kind.make();
+            if (!conf) {
+                DBG_AS(func, 0, "%s", kind.make_fail);
+                return ERR_NO_MEMORY;
+            }
+            conf->dbidx = n;
+            int rc = fill(conf, key);
+            if (rc != KORV_OK) {
+                kind.free(conf);
+                return rc;
+            }
+            list_append(&conf->node, got);
+            return KORV_OK;
+        });
+    });
+}
 
 // Entry number of value in list: >= 1, or the operation's result code
 // (-9980 not found, logged with not_found_fmt, one %s, at not_found_level;
@@ -213,6 +251,14 @@ struct FieldWrite {
 // Writes the fields of entry n of root in order; the first failure is
 // logged under func and gives -9981 (what was written stays).
 int write_fields(const char *func, const char *root, int n, std::initializer_list<FieldWrite> fields);
+
+// Deletes entry n of a list ("<root>/id:<n>", logged "xmldb_delete_node(%s)
+// failed", -9981), then decrements the list's counter with dec_count.
+int delete_entry(const char *func, const char *root, int n, int (*dec_count)(void));
+
+// Entry number of value under a sub-list: >= 1; -9980 (logged "can not find
+// %s" at level 2); -9981 (logged "db failed") when the scan fails.
+int find_in(const char *func, const Keyed &list, const char *value);
 
 // Removes entry n of a dense sub-list without hiding the entries after it:
 // the last entry's fields move into n, then the last entry goes. 0, or

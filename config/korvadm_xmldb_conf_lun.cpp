@@ -25,15 +25,16 @@ struct LunField {
     bool fail_with_rc = false;       // setters whose failure message names the code, not the value
 };
 
-// Entry number of the named LUN for a field operation, or its code.
-int lun_for_field(const char *func, const char *name, bool setter)
+// Path of the named LUN's field for a field operation: the LUN's entry
+// number, or its code.
+int lun_field(const char *func, const char *name, bool setter, const char *field, char (&path)[kPathLen])
 {
-    if (!name || !name[0]) {
-        DBG_AS(func, 0, "lun name error");
-        return ERR_PARAM;
-    }
-    return find_entry(func, kLuns, name,
-                      setter ? "can not find %s in xmldb entry" : "can not find %s in xmldb lun entry");
+    PARAM_GUARD_AS(func, !name || !name[0], "lun name error");
+    int n = find_entry(func, kLuns, name,
+                       setter ? "can not find %s in xmldb entry" : "can not find %s in xmldb lun entry");
+    if (n >= 1)
+        entry_path(path, kLuns.root, n, field);
+    return n;
 }
 
 int read_value(int32_t *out, const char *path) { return xmldb_get_int32_t(out, path); }
@@ -48,16 +49,12 @@ const char *log_arg(const char *v) { return v; }
 template <class T>
 int get_lun_number(const char *func, T *out, const char *name, const LunField &f)
 {
-    if (!out) {
-        DBG_AS(func, 0, "parameter error");
-        return ERR_PARAM;
-    }
-    int n = lun_for_field(func, name, false);
-    if (n < 1)
-        return n;
+    PARAM_GUARD_AS(func, !out);
     char path[kPathLen];
+    if (int n = lun_field(func, name, false, f.field, path); n < 1)
+        return n;
     T v{};
-    int rc = read_value(&v, entry_path(path, kLuns.root, n, f.field));
+    int rc = read_value(&v, path);
     if (rc != KORV_OK) {
         DBG_AS(func, 0, f.fail, rc);
         return rc;
@@ -68,16 +65,12 @@ int get_lun_number(const char *func, T *out, const char *name, const LunField &f
 
 int get_lun_text(const char *func, char *buf, size_t size, const char *name, const LunField &f)
 {
-    if (!buf || size == 0) {
-        DBG_AS(func, 0, "parameter error");
-        return ERR_PARAM;
-    }
-    int n = lun_for_field(func, name, false);
-    if (n < 1)
-        return n;
+    PARAM_GUARD_AS(func, !buf || size == 0);
     char path[kPathLen];
+    if (int n = lun_field(func, name, false, f.field, path); n < 1)
+        return n;
     buf[0] = '\0';
-    int rc = xmldb_get_cstring(buf, size, entry_path(path, kLuns.root, n, f.field));
+    int rc = xmldb_get_cstring(buf, size, path);
     if (rc != KORV_OK)
         DBG_AS(func, 0, f.fail, rc);
     return rc;
@@ -87,15 +80,11 @@ int get_lun_text(const char *func, char *buf, size_t size, const char *name, con
 template <class T>
 int set_lun_field(const char *func, T value, bool value_ok, const char *name, const LunField &f)
 {
-    int n = lun_for_field(func, name, true);
-    if (n < 1)
-        return n;
-    if (!value_ok) {
-        DBG_AS(func, 0, "%s", f.bad_value);
-        return ERR_PARAM;
-    }
     char path[kPathLen];
-    int rc = write_value(value, entry_path(path, kLuns.root, n, f.field));
+    if (int n = lun_field(func, name, true, f.field, path); n < 1)
+        return n;
+    PARAM_GUARD_AS(func, !value_ok, "%s", f.bad_value);
+    int rc = write_value(value, path);
     if (rc != KORV_OK) {
         if (f.fail_with_rc)
             DBG_AS(func, 0, f.fail, rc);
@@ -177,10 +166,7 @@ int xmldb_add_new_lun(lun_conf_t *conf)
                           : conf->size == 0                     ? "size is not given"
                           : conf->prealloc != 0 && conf->prealloc != 1 ? "prealloc is wrong"
                                                                 : nullptr;
-    if (invalid) {
-        DBG(0, "%s", invalid);
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(invalid, "%s", invalid);
     conf->vol_state = 1;
     int n = 0;
     int rc = _get_free_xmldb_id_entry(&n, kLuns.root, kLuns.max, kLuns.key);
@@ -227,13 +213,7 @@ int xmldb_del_lun_by_name(const char *name)
     if (n < 1)
         return n;
     DBG(1, "update xmldb - del lun %s @ db_idx = %d", name, n);
-    char path[kPathLen];
-    pathf(path, sizeof path, "%s/id:%d", kLuns.root, n);
-    if (xmldb_delete_node(path) != KORV_OK) {
-        DBG(0, "xmldb_delete_node(%s) failed", path);
-        return ERR_DB_WRITE;
-    }
-    return _xmldb_dec_lun_count();
+    return delete_entry(__func__, kLuns.root, n, _xmldb_dec_lun_count);
 }
 
 int xmldb_get_free_lun_devid(int *devid)

@@ -78,29 +78,13 @@ namespace {
 // service (or of memory) fails the whole read.
 int read_all_luns(const char *func, list_t *out, bool full)
 {
-    if (!out) {
-        DBG_AS(func, 0, "parameter error");
-        return ERR_PARAM;
-    }
-    return korv::fill_and_hand_over(out, lun_conf_free_list, [&](list_t *got) {
-        return walk_list(func, kLuns.root, kLuns.max, kLuns.key, CONF_NAME_LEN,
-                         "fill lun conf failed when lun = %s", [&](int n, const char *name) -> int {
-                             lun_conf_t *conf = lun_conf_new();
-                             if (!conf) {
-                                 DBG_AS(func, 0, "new l_conf failed");
-                                 return ERR_NO_MEMORY;
-                             }
-                             korv::copy_bounded(conf->name, name);
-                             conf->dbidx = n;
-                             int rc = full ? _xmldb_fill_lun_conf(conf, n) : KORV_OK;
-                             if (rc != KORV_OK) {
-                                 lun_conf_free(conf);
-                                 return rc;
-                             }
-                             list_append(&conf->node, got);
-                             return KORV_OK;
-                         });
-    });
+    PARAM_GUARD_AS(func, !out);
+    static constexpr RecordKind<lun_conf_t> kind{lun_conf_new, lun_conf_free, lun_conf_free_list, "new l_conf failed"};
+    return read_records(func, out, kind, kLuns, CONF_NAME_LEN, "fill lun conf failed when lun = %s",
+                        [&](lun_conf_t *conf, const char *name) -> int {
+                            korv::copy_bounded(conf->name, name);
+                            return full ? _xmldb_fill_lun_conf(conf, conf->dbidx) : KORV_OK;
+                        });
 }
 
 }  // namespace

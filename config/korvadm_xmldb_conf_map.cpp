@@ -16,14 +16,8 @@ namespace {
 // code of the first that is missing.
 int find_pair(const char *func, const char *target_name, const char *lun_name, int *t, int *l)
 {
-    if (!target_name || !target_name[0]) {
-        DBG_AS(func, 0, "target_name error");
-        return ERR_PARAM;
-    }
-    if (!lun_name || !lun_name[0]) {
-        DBG_AS(func, 0, "lun_name error");
-        return ERR_PARAM;
-    }
+    PARAM_GUARD_AS(func, !target_name || !target_name[0], "target_name error");
+    PARAM_GUARD_AS(func, !lun_name || !lun_name[0], "lun_name error");
     if ((*t = find_target(func, target_name)) < 1)
         return *t;
     if ((*l = find_entry(func, kLuns, lun_name, "can not find %s in xmldb lun entry")) < 1)
@@ -79,10 +73,7 @@ int xmldb_add_target_lun_map(const char *target_name, const char *lun_name, int 
     int rc = find_pair(__func__, target_name, lun_name, &t, &l);
     if (rc != KORV_OK)
         return rc;
-    if (lun_num < 0) {
-        DBG(0, "lun_num error");
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(lun_num < 0, "lun_num error");
     char root[kPathLen];
     map_root(root, t);
     int m = 0;
@@ -140,10 +131,7 @@ int xmldb_del_target_lun_map(const char *target_name, const char *lun_name)
 int xmldb_get_mapping_target(char *target_name, size_t size, int *lun_num, const char *lun_name)
 {
     PARAM_GUARD(!target_name || size == 0 || !lun_num);
-    if (!lun_name || !lun_name[0]) {
-        DBG(0, "lun name error");
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(!lun_name || !lun_name[0], "lun name error");
     int l = find_entry(__func__, kLuns, lun_name, "can not find %s in xmldb lun entry");
     if (l < 1)
         return l;
@@ -173,27 +161,19 @@ int xmldb_get_target_map_lun_conf(const char *target_name, list_t *list)
         return t;
     char root[kPathLen];
     map_root(root, t);
-    return korv::fill_and_hand_over(list, target_map_lun_conf_free_list, [&](list_t *got) {
-        return walk_list(__func__, root, CONF_MAX_MAP_LUNS, "lun_name", CONF_NAME_LEN, nullptr,
-                         [&](int m, const char *lun) -> int {
-                             char path[kPathLen];
-                             int32_t num = -1;
-                             int rc = xmldb_get_int32_t(&num, entry_path(path, root, m, "lun_num"));
-                             if (rc != KORV_OK) {
-                                 DBG(0, "get config - lun_num failed");
-                                 return rc;
-                             }
-                             target_map_lun_conf_t *conf = target_map_lun_conf_new();
-                             if (!conf) {
-                                 DBG(0, "new target_map_lun_conf_t failed");
-                                 return ERR_NO_MEMORY;
-                             }
-                             conf->dbidx = m;
-                             korv::copy_bounded(conf->target_name, target_name);
-                             korv::copy_bounded(conf->lun_name, lun);
-                             conf->lun_num = num;
-                             list_append(&conf->node, got);
-                             return KORV_OK;
-                         });
-    });
+    static constexpr RecordKind<target_map_lun_conf_t> kind{target_map_lun_conf_new, target_map_lun_conf_free,
+                                                            target_map_lun_conf_free_list,
+                                                            "new target_map_lun_conf_t failed"};
+    return read_records(__func__, list, kind, {root, CONF_MAX_MAP_LUNS, "lun_name"}, CONF_NAME_LEN, nullptr,
+                        [&](target_map_lun_conf_t *conf, const char *lun) -> int {
+                            char path[kPathLen];
+                            int rc = xmldb_get_int32_t(&conf->lun_num, entry_path(path, root, conf->dbidx, "lun_num"));
+                            if (rc != KORV_OK) {
+                                DBG(0, "get config - lun_num failed");
+                                return rc;
+                            }
+                            korv::copy_bounded(conf->target_name, target_name);
+                            korv::copy_bounded(conf->lun_name, lun);
+                            return KORV_OK;
+                        });
 }

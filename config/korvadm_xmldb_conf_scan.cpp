@@ -246,6 +246,31 @@ int xmldb_conf::write_fields(const char *func, const char *root, int n, std::ini
     return KORV_OK;
 }
 
+int xmldb_conf::delete_entry(const char *func, const char *root, int n, int (*dec_count)(void))
+{
+    char path[kPathLen];
+    pathf(path, sizeof path, "%s/id:%d", root, n);
+    if (xmldb_delete_node(path) != KORV_OK) {
+        DBG_AS(func, 0, "xmldb_delete_node(%s) failed", path);
+        return ERR_DB_WRITE;
+    }
+    return dec_count();
+}
+
+int xmldb_conf::find_in(const char *func, const Keyed &list, const char *value)
+{
+    int n = 0;
+    int rc = _search_xmldb_id_entry(&n, list.root, list.max, list.key, value);
+    if (rc == ID_ENTRY_FOUND)
+        return n;
+    if (rc == ID_ENTRY_NOT_FOUND) {
+        DBG_AS(func, 2, "can not find %s", value);
+        return ERR_NOT_FOUND;
+    }
+    DBG_AS(func, 0, "db failed");
+    return ERR_DB_WRITE;
+}
+
 int xmldb_conf::remove_compact(const char *func, const char *root, int n, int max, const char *key,
                                std::initializer_list<const char *> fields)
 {

@@ -34,29 +34,27 @@ constexpr size_t kSavedHostNameLen = 128;
 constexpr size_t kIpv4Len = 16;
 constexpr size_t kIpv6Len = 40;
 
-// Saved-address slot of an interface: 1, 2, or 0 for a name with none.
-int saved_addr_slot(const char *dev_name)
+// Path of an interface's saved-address slot ("bond0" and "egiga0" share
+// slot 1, "egiga1" has slot 2): KORV_OK, or -9980 for any other name.
+int saved_addr_path(const char *func, char (&path)[kPathLen], const char *dev_name, const char *fmt)
 {
-    if (std::strcmp(dev_name, "bond0") == 0 || std::strcmp(dev_name, "egiga0") == 0)
-        return 1;
-    if (std::strcmp(dev_name, "egiga1") == 0)
-        return 2;
-    return 0;
-}
-
-int get_saved_addr(const char *func, char *buf, size_t size, const char *dev_name, const char *fmt)
-{
-    if (!buf || !dev_name || !dev_name[0]) {
-        DBG_AS(func, 0, "parameter error");
-        return ERR_PARAM;
-    }
-    int slot = saved_addr_slot(dev_name);
+    const int slot = std::strcmp(dev_name, "bond0") == 0 || std::strcmp(dev_name, "egiga0") == 0 ? 1
+                     : std::strcmp(dev_name, "egiga1") == 0                                       ? 2
+                                                                                                  : 0;
     if (!slot) {
         DBG_AS(func, 0, "unknown interface %s", dev_name);
         return ERR_NOT_FOUND;
     }
-    char path[kPathLen];
     pathf(path, sizeof path, fmt, slot);
+    return KORV_OK;
+}
+
+int get_saved_addr(const char *func, char *buf, size_t size, const char *dev_name, const char *fmt)
+{
+    PARAM_GUARD_AS(func, !buf || !dev_name || !dev_name[0]);
+    char path[kPathLen];
+    if (int rc = saved_addr_path(func, path, dev_name, fmt); rc != KORV_OK)
+        return rc;
     buf[0] = '\0';
     if (xmldb_get_cstring(buf, size, path) != KORV_OK)
         return ERR_DB_WRITE;
@@ -65,19 +63,33 @@ int get_saved_addr(const char *func, char *buf, size_t size, const char *dev_nam
 
 int set_saved_addr(const char *func, const char *addr, const char *dev_name, const char *fmt)
 {
-    if (!addr || !addr[0] || !dev_name || !dev_name[0]) {
-        DBG_AS(func, 0, "parameter error");
-        return ERR_PARAM;
-    }
-    int slot = saved_addr_slot(dev_name);
-    if (!slot) {
-        DBG_AS(func, 0, "unknown interface %s", dev_name);
-        return ERR_NOT_FOUND;
-    }
+    PARAM_GUARD_AS(func, !addr || !addr[0] || !dev_name || !dev_name[0]);
     char path[kPathLen];
-    pathf(path, sizeof path, fmt, slot);
+    if (int rc = saved_addr_path(func, path, dev_name, fmt); rc != KORV_OK)
+        return rc;
     DBG_AS(func, 2, "set %s = %s", path, addr);
     return xmldb_set_cstring(addr, path) == KORV_OK ? KORV_OK : ERR_DB_WRITE;
+}
+
+// A saved text setting: the reader wants a buffer of at least need bytes,
+// empties it (whole, or its first byte) and logs fail when the service does
+// not answer.
+int get_saved_text(const char *func, char *buf, size_t size, size_t need, bool clear_whole, const char *path,
+                   const char *fail)
+{
+    PARAM_GUARD_AS(func, !buf || size < need);
+    std::memset(buf, 0, clear_whole ? size : 1);
+    if (xmldb_get_cstring(buf, size, path) != KORV_OK) {
+        DBG_AS(func, 0, "%s", fail);
+        return ERR_DB_WRITE;
+    }
+    return KORV_OK;
+}
+
+int set_saved_text(const char *func, const char *value, const char *path)
+{
+    PARAM_GUARD_AS(func, !value);
+    return xmldb_set_cstring(value, path) == KORV_OK ? KORV_OK : ERR_DB_WRITE;
 }
 
 // The platform reads at most INT_MAX bytes; larger buffers are simply not filled further.
@@ -209,37 +221,17 @@ int xmldb_set_korvadm_ver(int ver)
 
 int xmldb_get_saved_host_name(char *buf, size_t size)
 {
-    PARAM_GUARD(!buf || size < kSavedHostNameLen);
-    std::memset(buf, 0, size);
-    if (xmldb_get_cstring(buf, size, kHostName) != KORV_OK) {
-        DBG(0, "get saved host name error");
-        return ERR_DB_WRITE;
-    }
-    return KORV_OK;
+    return get_saved_text(__func__, buf, size, kSavedHostNameLen, true, kHostName, "get saved host name error");
 }
 
-int xmldb_set_saved_host_name(const char *host_name)
-{
-    PARAM_GUARD(!host_name);
-    return xmldb_set_cstring(host_name, kHostName) == KORV_OK ? KORV_OK : ERR_DB_WRITE;
-}
+int xmldb_set_saved_host_name(const char *host_name) { return set_saved_text(__func__, host_name, kHostName); }
 
 int xmldb_get_iqn_prefix(char *buf, size_t size)
 {
-    PARAM_GUARD(!buf || size < CONF_GEN_IQN_LEN);
-    buf[0] = '\0';
-    if (xmldb_get_cstring(buf, size, kIqnPrefix) != KORV_OK) {
-        DBG(0, "get saved iqn error");
-        return ERR_DB_WRITE;
-    }
-    return KORV_OK;
+    return get_saved_text(__func__, buf, size, CONF_GEN_IQN_LEN, false, kIqnPrefix, "get saved iqn error");
 }
 
-int xmldb_set_iqn_prefix(const char *prefix)
-{
-    PARAM_GUARD(!prefix);
-    return xmldb_set_cstring(prefix, kIqnPrefix) == KORV_OK ? KORV_OK : ERR_DB_WRITE;
-}
+int xmldb_set_iqn_prefix(const char *prefix) { return set_saved_text(__func__, prefix, kIqnPrefix); }
 
 int xmldb_get_saved_ipv4_addr(char *buf, const char *dev_name)
 {

@@ -21,17 +21,23 @@ int xmldb_conf::find_target(const char *func, const char *name)
 }
 
 namespace {
+// Path of the named target's field for a field operation: the target's
+// entry number, or its code.
+int target_field(const char *func, const char *name, const char *field, char (&path)[kPathLen])
+{
+    PARAM_GUARD_AS(func, !name);
+    int n = find_target(func, name);
+    if (n >= 1)
+        target_path(path, n, field);
+    return n;
+}
+
 int get_target_int(const char *func, int *out, const char *name, const char *field)
 {
-    if (!out || !name) {
-        DBG_AS(func, 0, "parameter error");
-        return ERR_PARAM;
-    }
-    int n = find_target(func, name);
-    if (n < 1)
-        return n;
+    PARAM_GUARD_AS(func, !out);
     char path[kPathLen];
-    target_path(path, n, field);
+    if (int n = target_field(func, name, field, path); n < 1)
+        return n;
     int32_t v = 0;
     int rc = xmldb_get_int32_t(&v, path);
     if (rc == ERR_INT_VALUE) {
@@ -48,15 +54,9 @@ int get_target_int(const char *func, int *out, const char *name, const char *fie
 
 int set_target_int(const char *func, int value, const char *name, const char *field)
 {
-    if (!name) {
-        DBG_AS(func, 0, "parameter error");
-        return ERR_PARAM;
-    }
-    int n = find_target(func, name);
-    if (n < 1)
-        return n;
     char path[kPathLen];
-    target_path(path, n, field);
+    if (int n = target_field(func, name, field, path); n < 1)
+        return n;
     if (xmldb_set_int32_t(value, path) != KORV_OK) {
         DBG_AS(func, 0, "set %s = %d failed", path, value);
         return ERR_DB_WRITE;
@@ -118,10 +118,7 @@ int xmldb_add_new_target(target_conf_t *conf)
                           : chap && !conf->chap_name[0]              ? "chap_name error"
                           : chap && !conf->chap_pwd[0]               ? "chap_password error"
                                                                      : nullptr;
-    if (invalid) {
-        DBG(0, "%s", invalid);
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(invalid, "%s", invalid);
     int n = 0;
     int rc = _get_free_xmldb_id_entry(&n, kTargetRoot, CONF_MAX_TARGETS, "name");
     if (rc == ID_ENTRY_NOT_FOUND) {
@@ -194,15 +191,9 @@ int xmldb_del_target_by_name(const char *name)
     if (n < 1)
         return n;
     DBG(1, "update xmldb");
-    char path[kPathLen];
-    pathf(path, sizeof path, "%s/id:%d", kTargetRoot, n);
     // Later entries keep their numbers: a name scan then stops at this gap
     // until the management logic rewrites the list.
-    if (xmldb_delete_node(path) != KORV_OK) {
-        DBG(0, "xmldb_delete_node(%s) failed", path);
-        return ERR_DB_WRITE;
-    }
-    return _xmldb_dec_target_count();
+    return delete_entry(__func__, kTargetRoot, n, _xmldb_dec_target_count);
 }
 
 int xmldb_get_target_state(int *state, const char *name) { return get_target_int(__func__, state, name, "state"); }
@@ -220,15 +211,9 @@ int xmldb_get_free_target_hba_id(int *hba_id)
 int xmldb_get_target_iqn(char *buf, size_t size, const char *name)
 {
     PARAM_GUARD(!buf || !name);
-    if (size < CONF_IQN_LEN) {
-        DBG(0, "parameter length error");
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(size < CONF_IQN_LEN, "parameter length error");
     int n = _xmldb_get_target_dbidx_by_name(name);
-    if (n < 1) {
-        DBG(0, "can not find %s", name);
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(n < 1, "can not find %s", name);
     return get_target_text(__func__, n, "iqn", buf, size);
 }
 
@@ -236,10 +221,7 @@ int xmldb_set_target_iqn(const char *iqn, const char *name)
 {
     PARAM_GUARD(!iqn || !name);
     int n = _xmldb_get_target_dbidx_by_name(name);
-    if (n < 1) {
-        DBG(0, "can not find %s", name);
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(n < 1, "can not find %s", name);
     char path[kPathLen];
     if (xmldb_set_cstring(iqn, target_path(path, n, "iqn")) != KORV_OK) {
         DBG(0, "set %s failed", path);
@@ -316,10 +298,7 @@ int xmldb_update_current_targetcnt(void)
 int xmldb_get_target_status(char *buf, size_t size, const char *name)
 {
     PARAM_GUARD(!buf || !name);
-    if (size < CONF_NAME_LEN) {
-        DBG(0, "parameter length error");
-        return ERR_PARAM;
-    }
+    PARAM_GUARD(size < CONF_NAME_LEN, "parameter length error");
     int n = find_target(__func__, name);
     if (n < 1)
         return n;

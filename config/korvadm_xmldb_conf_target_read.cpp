@@ -62,28 +62,14 @@ int fill_target_conf(const char *func, target_conf_t *conf, int n, bool full)
 // fails the whole read, so the caller can tell an outage from bad data.
 int read_all_targets(const char *func, list_t *out, bool full)
 {
-    if (!out) {
-        DBG_AS(func, 0, "parameter error");
-        return ERR_PARAM;
-    }
-    return korv::fill_and_hand_over(out, target_conf_free_list, [&](list_t *got) {
-        return walk_list(func, kTargetRoot, CONF_MAX_TARGETS, "name", CONF_NAME_LEN, nullptr,
-                         [&](int n, const char *name) -> int {
-                             target_conf_t *conf = target_conf_new();
-                             if (!conf) {
-                                 DBG_AS(func, 0, "new t_conf failed error");
-                                 return ERR_NO_MEMORY;
-                             }
-                             korv::copy_bounded(conf->name, name);
-                             int rc = fill_target_conf(func, conf, n, full);
-                             if (rc != KORV_OK) {
-                                 target_conf_free(conf);
-                                 return rc;
-                             }
-                             list_append(&conf->node, got);
-                             return KORV_OK;
-                         });
-    });
+    PARAM_GUARD_AS(func, !out);
+    static constexpr RecordKind<target_conf_t> kind{target_conf_new, target_conf_free, target_conf_free_list,
+                                                    "new t_conf failed error"};
+    return read_records(func, out, kind, kTargets, CONF_NAME_LEN, nullptr,
+                        [&](target_conf_t *conf, const char *name) -> int {
+                            korv::copy_bounded(conf->name, name);
+                            return fill_target_conf(func, conf, conf->dbidx, full);
+                        });
 }
 }  // namespace
 

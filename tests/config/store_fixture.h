@@ -1,12 +1,19 @@
 // SPDX-License-Identifier: Apache-2.0
 // A fresh configuration database service per test, with raw access to its
-// tree that bypasses the code under test.
+// tree that bypasses the code under test, and the checks the store's tests
+// share.
 #pragma once
 
+#include <cstdio>
+#include <functional>
+#include <memory>
 #include <string>
 
 #include <gtest/gtest.h>
 
+#include "common/korvadm_err.h"
+#include "common/korvadm_list.h"
+#include "config/korvadm_conf.h"
 #include "platform/xmldbc.h"
 #include "tests/support/capture.h"
 #include "tests/support/xmldbd_fixture.h"
@@ -17,6 +24,86 @@ namespace korv_test {
 inline std::string data_file(const char *name)
 {
     return std::string(KORV_CONFIG_DATA) + "/" + name;
+}
+
+// "<root>/id:<n>/<field>"
+inline std::string epath(const std::string &root, int n, const std::string &field)
+{
+    return root + "/id:" + std::to_string(n) + "/" + field;
+}
+
+// fn()'s result, run quietly; its log must hold message.
+template <class Fn>
+int logged(Fn fn, const std::string &message)
+{
+    std::string out;
+    int rc = quiet(fn, &out);
+    EXPECT_NE(out.find(message), std::string::npos) << "wanted: " << message << "\n" << out;
+    return rc;
+}
+
+// One record as text, per kind.
+inline std::string show(const target_conf_t *t)
+{
+    return std::string(t->name) + "/" + std::to_string(t->tpgt) + "/" + std::to_string(t->dbidx);
+}
+inline std::string show(const lun_conf_t *l)
+{
+    return std::string(l->name) + "/" + std::to_string(l->devid) + "/" + std::to_string(l->dbidx);
+}
+inline std::string show(const target_map_lun_conf_t *m)
+{
+    return std::string(m->target_name) + "/" + m->lun_name + "/" + std::to_string(m->lun_num);
+}
+inline std::string show(const acl_initiator_conf_t *a)
+{
+    return std::string(a->initiator) + "/" + a->alias + "/" + std::to_string(a->dbidx);
+}
+inline std::string show(const lun_acl_conf_t *a)
+{
+    return std::string(a->initiator) + "/" + a->alias + "/" + std::to_string(a->access_right);
+}
+
+// The records a list reader hands out, shown and separated by spaces; the
+// reader must answer want. Its log goes to *log when given.
+template <class T>
+std::string records(const std::function<int(list_t *)> &read, void (*free_list)(list_t *), int want = KORV_OK,
+                    std::string *log = nullptr)
+{
+    korv::list_owner list(free_list);
+    EXPECT_EQ(quiet([&] { return read(list.get()); }, log), want);
+    std::string out;
+    for (const T *r : korv::list_records<T>(list.get()))
+        out += (out.empty() ? "" : " ") + show(r);
+    return out;
+}
+
+// Valid records, as the management tool fills them.
+using target_ptr = std::unique_ptr<target_conf_t, void (*)(target_conf_t *)>;
+using lun_ptr = std::unique_ptr<lun_conf_t, void (*)(lun_conf_t *)>;
+inline target_ptr new_target(const std::string &name, int chap = 0)
+{
+    target_ptr t(target_conf_new(), target_conf_free);
+    std::snprintf(t->name, sizeof t->name, "%s", name.c_str());
+    std::snprintf(t->iqn, sizeof t->iqn, "iqn.2000-01.com.example:%s", name.c_str());
+    t->tpgt = 1;
+    t->state = t->hba_id = 0;
+    t->chap_enable = chap;
+    std::snprintf(t->chap_name, sizeof t->chap_name, "user");
+    std::snprintf(t->chap_pwd, sizeof t->chap_pwd, "secret12345678");
+    return t;
+}
+inline lun_ptr new_lun(const std::string &name, uint64_t size = 4096)
+{
+    lun_ptr l(lun_conf_new(), lun_conf_free);
+    std::snprintf(l->name, sizeof l->name, "%s", name.c_str());
+    std::snprintf(l->uuid, sizeof l->uuid, "vol-%s", name.c_str());
+    std::snprintf(l->serial, sizeof l->serial, "sn-%s", name.c_str());
+    std::snprintf(l->img_file, sizeof l->img_file, "/mnt/v/%s.img", name.c_str());
+    l->size = size;
+    l->devid = 3;
+    l->prealloc = 1;
+    return l;
 }
 
 class StoreTest : public ::testing::Test {
@@ -35,10 +122,8 @@ protected:
     {
         ASSERT_EQ(xmldbc_set(XMLDB_SOCK_ISCSI, 0, path.c_str(), value.c_str()), 0) << path;
     }
-    static std::string tpath(int id, const char *field)
-    {
-        return "/iscsi/target/id:" + std::to_string(id) + "/" + field;
-    }
+    static std::string tpath(int id, const char *field) { return epath("/iscsi/target", id, field); }
+    static std::string lpath(int id, const char *field) { return epath("/iscsi/lun", id, field); }
     // Writes a target entry directly, as another writer of the store would.
     static void put_target(int id, const std::string &name, int tpgt = 1, int hba_id = 0)
     {

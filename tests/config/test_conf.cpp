@@ -15,42 +15,28 @@
 #include "tests/config/store_fixture.h"
 #include "tests/support/capture.h"
 
-using korv_test::quiet;
-using korv_test::StoreTest;
-using korv_test::SysRoot;
+using namespace korv_test;
 
 TEST(Records, StartUnknownAndFreeingUnlinks)
 {
     // The readers rely on -1 for what the database did not supply.
-    target_conf_t *a = target_conf_new();
+    target_conf_t *a = target_conf_new(), *b = target_conf_new(), *c = target_conf_new();
     ASSERT_NE(a, nullptr);
     EXPECT_EQ(a->tpgt + a->state + a->chap_enable + a->hba_id, -4);
-    EXPECT_EQ(a->node.owner, a);
     lun_conf_t *l = lun_conf_new();
     EXPECT_EQ(l->devid + l->lun_num + l->prealloc, -3);
     target_map_lun_conf_t *m = target_map_lun_conf_new();
     EXPECT_EQ(m->lun_num, -1);
     target_map_lun_conf_free(m);
 
-    list_t list;
-    list_init(&list);
-    target_conf_t *b = target_conf_new();
-    target_conf_t *c = target_conf_new();
+    korv::list_owner targets(target_conf_free_list);
     for (target_conf_t *t : {a, b, c})
-        list_append(&t->node, &list);
+        list_append(&t->node, targets.get());
     target_conf_free(b);
-    EXPECT_EQ(list.count, 2);
     EXPECT_EQ(a->node.next, &c->node);
-    target_conf_free_list(&list);
-    EXPECT_TRUE(list_is_empty(&list));
-
     // A LUN record owns its private data: freed with it (ASan checks).
-    list_t luns;
-    list_init(&luns);
     l->priv = std::malloc(32);
-    list_append(&l->node, &luns);
-    lun_conf_free_list(&luns);
-    EXPECT_TRUE(list_is_empty(&luns));
+    lun_conf_free(l);
 }
 
 TEST(AccessRight, WordsMatchByPrefixIgnoringCaseUpToTenCharacters)
@@ -107,22 +93,22 @@ TEST_F(ConfContext, StoredDebugLevelBecomesTheProcessLevelWhenReadable)
     EXPECT_EQ(xmldb_get_debug_level(&level), ERR_INT_VALUE);
     EXPECT_EQ(level, 0);
     iscsi_conf_ctx_t ctx = {};
-    ctx.ops = &iscsi_conf_ops;
-    g_korv_debug_level = 1;
-    std::string out;
-    EXPECT_EQ(quiet([&] { return dbg_get_conf_target_debug_lv(&ctx); }, &out), 0);
-    EXPECT_EQ(g_korv_debug_level, 1);
-    EXPECT_EQ(out.find("get debug level"), std::string::npos);
     iscsi_conf_ops_t empty = {};
-    ctx.ops = &empty;
-    EXPECT_EQ(dbg_get_conf_target_debug_lv(&ctx), 0);
-
+    g_korv_debug_level = 1;
+    for (const iscsi_conf_ops_t *ops : {&iscsi_conf_ops, static_cast<const iscsi_conf_ops_t *>(&empty)}) {
+        ctx.ops = ops;
+        std::string out;
+        EXPECT_EQ(quiet([&] { return dbg_get_conf_target_debug_lv(&ctx); }, &out), 0);
+        EXPECT_EQ(g_korv_debug_level, 1);
+        EXPECT_EQ(out.find("get debug level"), std::string::npos);
+    }
     ctx.ops = &iscsi_conf_ops;
     g_korv_debug_level = 0;
     EXPECT_EQ(xmldb_set_debug_level(2), KORV_OK);
+    std::string out;
     EXPECT_EQ(quiet([&] { return dbg_get_conf_target_debug_lv(&ctx); }, &out), 2);
-    EXPECT_EQ(g_korv_debug_level, 2);
     EXPECT_NE(out.find("(korvadm_debug:dbg_get_conf_target_debug_lv:"), std::string::npos) << out;
     EXPECT_NE(out.find("get debug level = 2\n"), std::string::npos) << out;
+    EXPECT_EQ(g_korv_debug_level, 2);
     g_korv_debug_level = 0;
 }

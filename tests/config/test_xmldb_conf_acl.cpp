@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 // ACLs: initiators, rights kept on both sides, their removal, the readers,
 // and the session access records.
+#include <algorithm>
 #include <string>
 
 #include <gtest/gtest.h>
@@ -9,8 +10,7 @@
 #include "config/korvadm_xmldb_conf.h"
 #include "tests/config/store_fixture.h"
 
-using korv_test::quiet;
-using korv_test::StoreTest;
+using namespace korv_test;
 
 namespace {
 
@@ -19,7 +19,7 @@ protected:
     void SetUp() override
     {
         for (int n = 1; n <= 3; n++)
-            put("/iscsi/lun/id:" + std::to_string(n) + "/name", "l" + std::to_string(n));
+            put(lpath(n, "name"), "l" + std::to_string(n));
     }
     // Both sides as text: per initiator "iqn(alias)=lun:right,...", then per
     // LUN "lun=iqn:right,...", each list with its stored count.
@@ -27,21 +27,19 @@ protected:
     {
         std::string out;
         for (int a = 1; a <= 4; a++) {  // across a gap a delete left
-            if (raw(e("/iscsi/acl", a) + "/initiator").empty())
-                continue;
-            out += raw(e("/iscsi/acl", a) + "/initiator") + "(" + raw(e("/iscsi/acl", a) + "/alias") + ")=";
-            out += list(e("/iscsi/acl", a) + "/mapped_lun", "lun_name") + " ";
+            if (!raw(epath("/iscsi/acl", a, "initiator")).empty())
+                out += raw(epath("/iscsi/acl", a, "initiator")) + "(" + raw(epath("/iscsi/acl", a, "alias")) + ")=" +
+                       list(epath("/iscsi/acl", a, "mapped_lun"), "lun_name") + " ";
         }
         for (int l = 1; l <= 3; l++)
-            out += "l" + std::to_string(l) + "=" + list(e("/iscsi/lun", l) + "/acl", "initiator") + " ";
+            out += "l" + std::to_string(l) + "=" + list(lpath(l, "acl"), "initiator") + " ";
         return out;
     }
-    static std::string e(const std::string &root, int n) { return root + "/id:" + std::to_string(n); }
     static std::string list(const std::string &root, const char *key)
     {
         std::string out;
-        for (int n = 1; !raw(e(root, n) + "/" + key).empty(); n++)
-            out += raw(e(root, n) + "/" + key) + ":" + raw(e(root, n) + "/access_right") + ",";
+        for (int n = 1; !raw(epath(root, n, key)).empty(); n++)
+            out += raw(epath(root, n, key)) + ":" + raw(epath(root, n, "access_right")) + ",";
         return out + "#" + raw(root + "/count");
     }
 };
@@ -67,22 +65,18 @@ TEST_F(Acl, GrantingAddsAnUnknownInitiatorAndWritesBothSides)
     EXPECT_STREQ(buf, "");
 
     // Refused grants write nothing, not even the initiator.
-    struct {
-        int rc;
+    const struct {
         const char *initiator, *lun, *message;
         int right;
     } refused[] = {
-        {ERR_PARAM, "iqn.c", "l1", "access right error", 3},
-        {ERR_PARAM, "", "l1", "initiator name error", 1},
-        {ERR_PARAM, "iqn.c", "", "lun name error", 1},
-        {ERR_PARAM, "iqn.c", "l9", "lun name not exist", 1},
+        {"iqn.c", "l1", "access right error", 3},
+        {"", "l1", "initiator name error", 1},
+        {"iqn.c", "", "lun name error", 1},
+        {"iqn.c", "l9", "lun name not exist", 1},
     };
     const std::string before = sides();
-    for (const auto &r : refused) {
-        std::string out;
-        EXPECT_EQ(quiet([&] { return xmldb_set_lun_acl(r.initiator, "C", r.lun, r.right); }, &out), r.rc);
-        EXPECT_NE(out.find(r.message), std::string::npos) << out;
-    }
+    for (const auto &r : refused)
+        EXPECT_EQ(logged([&] { return xmldb_set_lun_acl(r.initiator, "C", r.lun, r.right); }, r.message), ERR_PARAM);
     EXPECT_EQ(sides(), before);
 }
 
@@ -103,12 +97,12 @@ TEST_F(Acl, RemovalsKeepBothSidesInAgreement)
 
     // Half-written pairs are reported and passed over.
     put("/iscsi/lun/id:2/acl/id:1/initiator", "iqn.a");  // a has no l2 on its side
-    std::string out;
-    EXPECT_EQ(quiet([] { return xmldb_remove_lun_from_all_acl("l2"); }, &out), KORV_OK);
-    EXPECT_NE(out.find("error l2 is not exist on initiator iqn.a, the acl might be inconsistency"), std::string::npos)
-        << out;
-    EXPECT_EQ(quiet([] { return xmldb_del_acl_initiator("iqn.c"); }, &out), KORV_OK);  // l2's side is gone
-    EXPECT_NE(out.find("error iqn.c is not exist on lun l2, the acl might be inconsistency"), std::string::npos) << out;
+    EXPECT_EQ(logged([] { return xmldb_remove_lun_from_all_acl("l2"); },
+                     "error l2 is not exist on initiator iqn.a, the acl might be inconsistency"),
+              KORV_OK);
+    EXPECT_EQ(logged([] { return xmldb_del_acl_initiator("iqn.c"); },  // l2's side is gone
+                     "error iqn.c is not exist on lun l2, the acl might be inconsistency"),
+              KORV_OK);
     EXPECT_EQ(sides(), "iqn.a(a)=#0 iqn.b(b)=#0 l1=# l2=# l3=# ");
     EXPECT_EQ(quiet([] { return xmldb_del_acl_initiator("iqn.nobody"); }), ERR_NOT_FOUND);
 }
@@ -117,29 +111,24 @@ TEST_F(Acl, ReadersAndTheInitiatorLimit)
 {
     ASSERT_EQ(xmldb_set_lun_acl("iqn.a", "A", "l1", 2), KORV_OK);
     ASSERT_EQ(xmldb_set_lun_acl("iqn.b", "B", "l1", 0), KORV_OK);
-    list_t list;
-    list_init(&list);
-    ASSERT_EQ(xmldb_get_all_lun_acl_conf_from_lun("l1", &list), KORV_OK);
-    std::string got;
-    for (lun_acl_conf_t *r : korv::list_records<lun_acl_conf_t>(&list))
-        got += std::string(r->initiator) + "/" + r->alias + "/" + std::to_string(r->access_right) + " ";
-    lun_acl_conf_free_list(&list);
-    EXPECT_EQ(got, "iqn.a/A/2 iqn.b/B/0 ");
-    EXPECT_EQ(quiet([&] { return xmldb_get_all_lun_acl_conf_from_lun("l9", &list); }), ERR_NOT_FOUND);
+    EXPECT_EQ(records<lun_acl_conf_t>([](list_t *l) { return xmldb_get_all_lun_acl_conf_from_lun("l1", l); },
+                                      lun_acl_conf_free_list),
+              "iqn.a/A/2 iqn.b/B/0");
+    EXPECT_EQ(records<lun_acl_conf_t>([](list_t *l) { return xmldb_get_all_lun_acl_conf_from_lun("l9", l); },
+                                      lun_acl_conf_free_list, ERR_NOT_FOUND),
+              "");
 
     for (int a = 3; a <= 129; a++) {
-        put("/iscsi/acl/id:" + std::to_string(a) + "/initiator", "iqn.n" + std::to_string(a));
-        put("/iscsi/acl/id:" + std::to_string(a) + "/alias", "n" + std::to_string(a));
+        put(epath("/iscsi/acl", a, "initiator"), "iqn.n" + std::to_string(a));
+        put(epath("/iscsi/acl", a, "alias"), "n" + std::to_string(a));
     }
-    ASSERT_EQ(xmldb_get_all_acl_initiator_conf_lite(&list), KORV_OK);
-    EXPECT_EQ(list.count, 129);
-    auto *last = static_cast<acl_initiator_conf_t *>(list.tail->owner);
-    EXPECT_EQ(std::string(last->initiator) + "/" + last->alias + "/" + std::to_string(last->dbidx), "iqn.n129/n129/129");
-    acl_initiator_conf_free_list(&list);
-
-    std::string out;
-    EXPECT_EQ(quiet([] { return xmldb_set_lun_acl("iqn.new", "N", "l2", 1); }, &out), ERR_NO_ROOM);
-    EXPECT_NE(out.find("the maximum number of targets has reached"), std::string::npos) << out;
+    const std::string all =
+        records<acl_initiator_conf_t>(xmldb_get_all_acl_initiator_conf_lite, acl_initiator_conf_free_list);
+    EXPECT_EQ(std::count(all.begin(), all.end(), ' '), 128);
+    EXPECT_EQ(all.substr(all.rfind(' ') + 1), "iqn.n129/n129/129");
+    EXPECT_EQ(logged([] { return xmldb_set_lun_acl("iqn.new", "N", "l2", 1); },
+                     "the maximum number of targets has reached"),
+              ERR_NO_ROOM);
     EXPECT_EQ(raw("/iscsi/acl/id:130/initiator") + raw("/iscsi/lun/id:2/acl/id:1/initiator"), "");
 }
 

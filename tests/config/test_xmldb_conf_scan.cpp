@@ -1,17 +1,18 @@
 // SPDX-License-Identifier: Apache-2.0
-// The numbered-entry scanner and the counters, and what they make of a
-// store another writer corrupted.
+// The numbered-entry scanner and the counters, the rules every keyed list
+// shares (capacity, free numbers, delete, recount, whole-read failure), and
+// what the store makes of full tables and of a store another writer corrupted.
 #include <string>
 
 #include <gtest/gtest.h>
 
 #include "common/korvadm_err.h"
+#include "common/korvadm_log.h"
 #include "config/korvadm_xmldb_conf.h"
 #include "config/korvadm_xmldb_conf_internal.h"
 #include "tests/config/store_fixture.h"
 
-using korv_test::quiet;
-using korv_test::StoreTest;
+using namespace korv_test;
 
 using IdEntryScan = StoreTest;
 
@@ -37,47 +38,115 @@ TEST_F(IdEntryScan, MatchesWholeValuesUpToTheLimitAndAnEmptyKeyHidesTheRest)
     EXPECT_EQ(_cal_xmldb_id_entry_count("/l", 2, "name"), 2);
     EXPECT_EQ(_get_free_xmldb_id_entry(&id, "/l", 3, "name"), ID_ENTRY_NOT_FOUND);
     EXPECT_EQ(quiet([&] { return _search_xmldb_id_entry(&id, nullptr, 10, "name", "a"); }), ERR_PARAM);
-}
 
-TEST_F(IdEntryScan, CountersNeverGoBelowZeroAndAclRecountStopsAtAGap)
-{
-    put("/iscsi/lun/count", "-5");  // a negative count counts as 0
+    // Counters never go below zero; a negative one counts as 0.
+    put("/iscsi/lun/count", "-5");
     EXPECT_EQ(_xmldb_inc_lun_count(), KORV_OK);
-    EXPECT_EQ(raw("/iscsi/lun/count"), "1");
-    EXPECT_EQ(_xmldb_dec_target_count(), KORV_OK);
-    EXPECT_EQ(_xmldb_inc_target_count(), KORV_OK);
+    EXPECT_EQ(_xmldb_dec_target_count(), KORV_OK);  // from nothing: stays 0
     EXPECT_EQ(_xmldb_inc_target_count(), KORV_OK);
     EXPECT_EQ(_xmldb_inc_target_lun_map_cnt(3), KORV_OK);
-    EXPECT_EQ(raw("/iscsi/target/count") + raw("/iscsi/target/id:3/map_lun/count"), "21");
-
+    EXPECT_EQ(raw("/iscsi/lun/count") + raw("/iscsi/target/count") + raw(tpath(3, "map_lun/count")), "111");
     put("/iscsi/acl/id:1/initiator", "iqn.a");
-    put("/iscsi/acl/id:2/initiator", "iqn.b");
-    put("/iscsi/acl/id:4/initiator", "iqn.d");
+    put("/iscsi/acl/id:3/initiator", "iqn.c");
     EXPECT_EQ(iscsi_conf_ops.xmldb_update_current_aclcnt(), KORV_OK);
-    EXPECT_EQ(raw("/iscsi/acl/count"), "2");
+    EXPECT_EQ(raw("/iscsi/acl/count"), "1");
 }
 
 namespace {
 
-// Names of a list reader's records, in order.
-template <class T>
-std::string names(int (*reader)(list_t *), void (*free_list)(list_t *), char (T::*field)[sizeof(T::name)])
-{
-    list_t list;
-    list_init(&list);
-    EXPECT_EQ(quiet([&] { return reader(&list); }), KORV_OK);
-    std::string out;
-    for (T *r : korv::list_records<T>(&list))
-        out += std::string(r->*field) + " ";
-    free_list(&list);
-    return out;
-}
-
-class HostileStore : public StoreTest {
-protected:
-    HostileStore() : StoreTest(korv_test::data_file("hostile.xml")) {}
+// The two top-level keyed lists and their operations.
+struct KeyedList {
+    const char *root;
+    int capacity;
+    const char *number;  // the field whose free value the list hands out
+    int (*add)(const char *name);
+    const char *full_message;
+    int (*check_add)(const char *name);
+    int (*free_number)(int *out);
+    int (*del)(const char *name);
+    int (*recount)();
 };
 
+const KeyedList kLists[] = {
+    {"/iscsi/target", 64, "hba_id", [](const char *n) { return xmldb_add_new_target(new_target(n).get()); },
+     "the maximum number of targets has reached", xmldb_check_add_target, xmldb_get_free_target_hba_id,
+     xmldb_del_target_by_name, xmldb_update_current_targetcnt},
+    {"/iscsi/lun", 128, "devid", [](const char *n) { return xmldb_add_new_lun(new_lun(n).get()); },
+     "the Maximum number of LUNs has reached", xmldb_check_add_lun, xmldb_get_free_lun_devid, xmldb_del_lun_by_name,
+     xmldb_update_lun_current_count},
+};
+
+}  // namespace
+
+using Lists = StoreTest;
+
+TEST_F(Lists, AFullListRefusesTheNextEntryAndHasNoFreeNumber)
+{
+    for (const KeyedList &l : kLists) {
+        for (int n = 1; n <= l.capacity; n++) {
+            put(epath(l.root, n, "name"), "e" + std::to_string(n));
+            put(epath(l.root, n, l.number), std::to_string(n - 1));
+        }
+        const std::string next = "e" + std::to_string(l.capacity + 1);
+        EXPECT_EQ(logged([&] { return l.add(next.c_str()); }, l.full_message), ERR_NO_ROOM) << l.root;
+        EXPECT_EQ(raw(epath(l.root, l.capacity + 1, "name")) + raw(std::string(l.root) + "/count"), "");
+        EXPECT_EQ(l.check_add(next.c_str()), ERR_NO_ROOM);
+        EXPECT_EQ(l.check_add("e2"), 1);
+        int num = 0;
+        EXPECT_EQ(quiet([&] { return l.free_number(&num); }), ERR_NO_ROOM);
+        EXPECT_EQ(num, -1);
+        // A number out of range is ignored, so 2 is free again.
+        put(epath(l.root, 3, l.number), std::to_string(l.capacity + 6));
+        EXPECT_EQ(quiet([&] { return l.free_number(&num); }), KORV_OK);
+        EXPECT_EQ(num, 2) << l.root;
+    }
+}
+
+TEST_F(Lists, DeleteLeavesAGapAndTheRecountRemovesOnlyANamelessGhostAtCountPlusOne)
+{
+    g_korv_debug_level = 1;  // the ghost's removal is logged as a detail
+    for (const KeyedList &l : kLists) {
+        // Named 1, 2, 4, 6; a ghost (status, no name) at 5, another at 7.
+        const std::string root = l.root;
+        for (int n = 1; n <= 7; n++) {
+            put(epath(root, n, "status"), n == 1 || n >= 5 ? "Ready" : "Inactive");
+            if (n != 3 && n != 5 && n != 7)
+                put(epath(root, n, "name"), "e" + std::to_string(n));
+        }
+        put(root + "/count", "17");
+        EXPECT_EQ(logged(l.recount, "discover and remove ghost entry at PATH: " + root + "/id:5"), KORV_OK);
+        EXPECT_EQ(raw(root + "/count") + raw(epath(root, 5, "status")) + raw(epath(root, 7, "status")), "4Ready");
+        EXPECT_EQ(raw(epath(root, 4, "name")) + raw(epath(root, 6, "name")), "e4e6");
+
+        // After a middle delete, count + 1 is a real entry: its status does not make it a ghost.
+        EXPECT_EQ(quiet([&] { return l.del("e2"); }), KORV_OK);
+        EXPECT_EQ(raw(epath(root, 2, "status")) + raw(root + "/count"), "3");
+        EXPECT_EQ(quiet([&] { return l.check_add("e4"); }), 0);  // hidden behind the gap
+        EXPECT_EQ(quiet([&] { return l.del("e2"); }), ERR_NOT_FOUND);
+        EXPECT_EQ(quiet(l.recount), KORV_OK);
+        EXPECT_EQ(raw(epath(root, 4, "name")) + raw(root + "/count"), "e43");
+    }
+    g_korv_debug_level = 0;
+    EXPECT_EQ(raw("/iscsi/target/running_count"), "2");
+}
+
+TEST_F(Lists, OnlyADeadServiceFailsAWholeReadAndNothingIsHandedOut)
+{
+    db().kill();
+    EXPECT_EQ(records<target_conf_t>(xmldb_get_all_target_conf_lite, target_conf_free_list, ERR_DB_CLIENT), "");
+    EXPECT_EQ(records<target_conf_t>(xmldb_get_all_target_conf, target_conf_free_list, ERR_DB_CLIENT), "");
+    for (auto read : {xmldb_get_all_lun_conf, xmldb_get_all_lun_conf_lite, xmldb_get_all_lun_conf_in_crash_conf})
+        EXPECT_EQ(records<lun_conf_t>(read, lun_conf_free_list, ERR_DB_CLIENT), "");
+    EXPECT_EQ(records<acl_initiator_conf_t>(xmldb_get_all_acl_initiator_conf_lite, acl_initiator_conf_free_list,
+                                            ERR_DB_CLIENT),
+              "");
+}
+
+namespace {
+class HostileStore : public StoreTest {
+protected:
+    HostileStore() : StoreTest(data_file("hostile.xml")) {}
+};
 }  // namespace
 
 TEST_F(HostileStore, CountsAreBoundedAndBrokenRecordsSkippedEverywhere)
@@ -85,21 +154,16 @@ TEST_F(HostileStore, CountsAreBoundedAndBrokenRecordsSkippedEverywhere)
     // Counts of -5, "abc" and 1000000 under every list, keys too long for
     // their records, a right that is no word: each operation ends with a
     // code, reads only what fits, and hands out the good records.
-    EXPECT_EQ(names<lun_conf_t>(xmldb_get_all_lun_conf, lun_conf_free_list, &lun_conf_t::name), "l1 l3 ");
-    EXPECT_EQ(names<target_conf_t>(xmldb_get_all_target_conf, target_conf_free_list, &target_conf_t::name), "t1 ");
-    list_t list;
-    list_init(&list);
-    ASSERT_EQ(quiet([&] { return xmldb_get_target_map_lun_conf("t1", &list); }), KORV_OK);
-    EXPECT_EQ(list.count, 1);
-    target_map_lun_conf_free_list(&list);
-    ASSERT_EQ(quiet([&] { return xmldb_get_all_lun_acl_conf_from_lun("l1", &list); }), KORV_OK);
-    ASSERT_EQ(list.count, 1);
-    EXPECT_STREQ(static_cast<lun_acl_conf_t *>(list.head->owner)->initiator, "iqn.a");
-    lun_acl_conf_free_list(&list);
-    ASSERT_EQ(quiet([&] { return xmldb_get_all_acl_initiator_conf_lite(&list); }), KORV_OK);
-    ASSERT_EQ(list.count, 2);
-    EXPECT_EQ(std::string(static_cast<acl_initiator_conf_t *>(list.tail->owner)->alias), std::string(127, 'x'));
-    acl_initiator_conf_free_list(&list);
+    EXPECT_EQ(records<lun_conf_t>(xmldb_get_all_lun_conf, lun_conf_free_list), "l1/1000000/1 l3/-1/3");
+    EXPECT_EQ(records<target_conf_t>(xmldb_get_all_target_conf, target_conf_free_list), "t1/1/1");
+    EXPECT_EQ(records<target_map_lun_conf_t>([](list_t *l) { return xmldb_get_target_map_lun_conf("t1", l); },
+                                             target_map_lun_conf_free_list),
+              "t1/l1/0");
+    EXPECT_EQ(records<lun_acl_conf_t>([](list_t *l) { return xmldb_get_all_lun_acl_conf_from_lun("l1", l); },
+                                      lun_acl_conf_free_list),
+              "iqn.a/a/2");
+    EXPECT_EQ(records<acl_initiator_conf_t>(xmldb_get_all_acl_initiator_conf_lite, acl_initiator_conf_free_list),
+              "iqn.a/a/1 iqn.c/" + std::string(127, 'x') + "/3");
 
     int num = -1;
     EXPECT_EQ(quiet([&] { return xmldb_get_free_lun_num(&num, "t1"); }), KORV_OK);
@@ -125,7 +189,7 @@ TEST_F(FullStore, EveryReaderReturnsEveryRecordOfFullTables)
     put_target(2, "t2");
     for (int n = 1; n <= 128; n++) {
         const std::string name = "l" + std::to_string(n);
-        put("/iscsi/lun/id:" + std::to_string(n) + "/name", name);
+        put(lpath(n, "name"), name);
         ASSERT_EQ(xmldb_add_target_lun_map(n % 2 ? "t1" : "t2", name.c_str(), n / 2), KORV_OK) << n;
         for (const char *i : {"iqn.a", "iqn.b", "iqn.c"})
             ASSERT_EQ(xmldb_set_lun_acl(i, i + 4, name.c_str(), n % 3), KORV_OK) << n;
@@ -133,21 +197,18 @@ TEST_F(FullStore, EveryReaderReturnsEveryRecordOfFullTables)
     for (int a = 4; a <= 129; a++)
         ASSERT_EQ(xmldb_add_acl_initiator(("iqn.n" + std::to_string(a)).c_str(), "n"), KORV_OK) << a;
 
-    list_t list;
-    list_init(&list);
-    ASSERT_EQ(xmldb_get_all_lun_conf(&list), KORV_OK);
-    ASSERT_EQ(list.count, 128);
-    auto *last = static_cast<lun_conf_t *>(list.tail->owner);
+    korv::list_owner luns(lun_conf_free_list);
+    ASSERT_EQ(xmldb_get_all_lun_conf(luns.get()), KORV_OK);
+    ASSERT_EQ(luns.get()->count, 128);
+    auto *last = static_cast<lun_conf_t *>(luns.get()->tail->owner);
     EXPECT_EQ(std::string(last->target_name) + ":" + std::to_string(last->lun_num), "t2:64");
-    lun_conf_free_list(&list);
-    ASSERT_EQ(xmldb_get_target_map_lun_conf("t2", &list), KORV_OK);
-    EXPECT_EQ(list.count, 64);
-    target_map_lun_conf_free_list(&list);
-    ASSERT_EQ(xmldb_get_all_lun_acl_conf_from_lun("l128", &list), KORV_OK);
-    EXPECT_EQ(list.count, 3);
-    lun_acl_conf_free_list(&list);
-    ASSERT_EQ(xmldb_get_all_acl_initiator_conf_lite(&list), KORV_OK);
-    EXPECT_EQ(list.count, 129);
-    acl_initiator_conf_free_list(&list);
+    korv::list_owner map(target_map_lun_conf_free_list), acl(lun_acl_conf_free_list),
+        initiators(acl_initiator_conf_free_list);
+    ASSERT_EQ(xmldb_get_target_map_lun_conf("t2", map.get()), KORV_OK);
+    ASSERT_EQ(xmldb_get_all_lun_acl_conf_from_lun("l128", acl.get()), KORV_OK);
+    ASSERT_EQ(xmldb_get_all_acl_initiator_conf_lite(initiators.get()), KORV_OK);
+    EXPECT_EQ(std::to_string(map.get()->count) + "/" + std::to_string(acl.get()->count) + "/" +
+                  std::to_string(initiators.get()->count),
+              "64/3/129");
     EXPECT_EQ(raw("/iscsi/acl/id:2/mapped_lun/count"), "128");
 }

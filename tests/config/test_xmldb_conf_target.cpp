@@ -1,81 +1,41 @@
 // SPDX-License-Identifier: Apache-2.0
-// The numbered-entry scanner, the counters and the target schema.
+// Targets: add, the field operations by name, connection records, and the
+// record readers.
 #include <cstring>
 #include <string>
 
 #include <gtest/gtest.h>
 
 #include "common/korvadm_err.h"
-#include "common/korvadm_log.h"
-#include "config/korvadm_conf.h"
 #include "config/korvadm_xmldb_conf.h"
-#include "config/korvadm_xmldb_conf_internal.h"
 #include "tests/config/store_fixture.h"
-#include "tests/support/capture.h"
 
-using korv_test::quiet;
-using korv_test::StoreTest;
+using namespace korv_test;
 
-namespace {
+using Targets = StoreTest;
 
-target_conf_t *filled_target(const char *name, int chap = 0)
+TEST_F(Targets, AddWritesEveryFieldButCredentialsOnlyWithChapOn)
 {
-    target_conf_t *t = target_conf_new();
-    std::snprintf(t->name, sizeof t->name, "%s", name);
-    std::snprintf(t->iqn, sizeof t->iqn, "iqn.2000-01.com.example:%s", name);
-    t->tpgt = 1;
-    t->state = 0;
-    t->chap_enable = chap;
-    t->hba_id = 0;
-    std::strcpy(t->chap_name, "user");
-    std::strcpy(t->chap_pwd, "secret12345678");
-    return t;
-}
-
-// The targets reader finds, as "name/tpgt/dbidx" per record.
-std::string read_targets(int (*reader)(list_t *), std::string *log = nullptr)
-{
-    list_t list;
-    list_init(&list);
-    EXPECT_EQ(quiet([&] { return reader(&list); }, log), KORV_OK);
-    std::string out;
-    for (target_conf_t *t : korv::list_records<target_conf_t>(&list))
-        out += std::string(out.empty() ? "" : " ") + t->name + "/" + std::to_string(t->tpgt) + "/" +
-               std::to_string(t->dbidx);
-    target_conf_free_list(&list);
-    return out;
-}
-
-}  // namespace
-
-using TargetAdd = StoreTest;
-
-TEST_F(TargetAdd, WritesEveryFieldButCredentialsOnlyWithChapOn)
-{
-    target_conf_t *t = filled_target("t1", 1);
+    target_ptr t = new_target("t1", 1);
     t->tpgt = 3;
     t->hba_id = 7;
-    ASSERT_EQ(xmldb_add_new_target(t), KORV_OK);
+    ASSERT_EQ(xmldb_add_new_target(t.get()), KORV_OK);
     EXPECT_EQ(t->dbidx, 1);
     const char *want[][2] = {{"name", "t1"},        {"iqn", "iqn.2000-01.com.example:t1"}, {"tpgt", "3"},
                              {"hba_id", "7"},       {"chap_enable", "1"},                  {"chap_name", "user"},
                              {"chap_pwd", "secret12345678"}, {"map_lun/count", "0"}};
     for (auto [field, value] : want)
         EXPECT_EQ(raw(tpath(1, field)), value) << field;
-    target_conf_free(t);
 
-    t = filled_target("t2", 0);  // credentials left in the record must not be written
-    ASSERT_EQ(xmldb_add_new_target(t), KORV_OK);
-    EXPECT_EQ(t->dbidx, 2);
-    EXPECT_EQ(raw(tpath(2, "chap_enable")), "0");
-    EXPECT_EQ(raw(tpath(2, "chap_name")) + raw(tpath(2, "chap_pwd")), "");
+    t = new_target("t2", 0);  // credentials left in the record must not be written
+    ASSERT_EQ(xmldb_add_new_target(t.get()), KORV_OK);
+    EXPECT_EQ(raw(tpath(2, "chap_enable")) + raw(tpath(2, "chap_name")) + raw(tpath(2, "chap_pwd")), "0");
     EXPECT_EQ(raw("/iscsi/target/count"), "2");
-    target_conf_free(t);
 }
 
-TEST_F(TargetAdd, RefusesInvalidRecordsBeforeAnyWrite)
+TEST_F(Targets, AddRefusesInvalidRecordsBeforeAnyWrite)
 {
-    struct Case {
+    const struct {
         const char *message;
         void (*spoil)(target_conf_t *);
     } cases[] = {
@@ -90,41 +50,15 @@ TEST_F(TargetAdd, RefusesInvalidRecordsBeforeAnyWrite)
         {"chap_password error", [](target_conf_t *t) { t->chap_enable = 1; t->chap_pwd[0] = '\0'; }},
     };
     for (const auto &c : cases) {
-        target_conf_t *t = filled_target("bad");
-        c.spoil(t);
-        std::string out;
-        EXPECT_EQ(quiet([&] { return xmldb_add_new_target(t); }, &out), ERR_PARAM) << c.message;
-        EXPECT_NE(out.find(c.message), std::string::npos) << out;
-        target_conf_free(t);
+        target_ptr t = new_target("bad");
+        c.spoil(t.get());
+        EXPECT_EQ(logged([&] { return xmldb_add_new_target(t.get()); }, c.message), ERR_PARAM);
     }
     EXPECT_EQ(raw(tpath(1, "name")) + raw("/iscsi/target/count"), "");
     EXPECT_EQ(quiet([&] { return xmldb_add_new_target(nullptr); }), ERR_PARAM);
 }
 
-TEST_F(TargetAdd, SixtyFifthTargetIsRefusedAndWritesNothing)
-{
-    for (int i = 1; i <= 64; i++)
-        put_target(i, "t" + std::to_string(i), 1, i - 1);
-    int id = -1;
-    EXPECT_EQ(_get_free_xmldb_id_entry(&id, "/iscsi/target", 64, "name"), ID_ENTRY_NOT_FOUND);
-    EXPECT_EQ(id, 0);
-    EXPECT_EQ(xmldb_check_add_target("t65"), ERR_NO_ROOM);
-    EXPECT_EQ(xmldb_check_add_target("t64"), 1);
-
-    target_conf_t *t = filled_target("t65");
-    EXPECT_EQ(quiet([&] { return xmldb_add_new_target(t); }), ERR_NO_ROOM);
-    EXPECT_EQ(raw(tpath(65, "name")) + raw("/iscsi/target/count"), "");
-    target_conf_free(t);
-    EXPECT_EQ(quiet([&] { return xmldb_get_free_target_hba_id(&id); }), ERR_NO_ROOM);
-    EXPECT_EQ(id, -1);
-    put(tpath(3, "hba_id"), "70");  // out of range: ignored, and number 2 is free again
-    EXPECT_EQ(quiet([&] { return xmldb_get_free_target_hba_id(&id); }), KORV_OK);
-    EXPECT_EQ(id, 2);
-}
-
-using TargetFields = StoreTest;
-
-TEST_F(TargetFields, ReadAndWriteByNameIncludingChap)
+TEST_F(Targets, FieldsAreReadAndWrittenByNameIncludingChapAndConnections)
 {
     put_target(1, "alpha", 2, 4);
     put_target(2, "beta", 5, 6);
@@ -143,7 +77,9 @@ TEST_F(TargetFields, ReadAndWriteByNameIncludingChap)
     // A missing name is "not found" except for the IQN, which reports a parameter error.
     EXPECT_EQ(quiet([&] { return xmldb_set_target_state(1, "gamma"); }), ERR_NOT_FOUND);
     EXPECT_EQ(quiet([&] { return xmldb_get_target_iqn(buf, sizeof buf, "gamma"); }), ERR_PARAM);
-    EXPECT_EQ(quiet([&] { return xmldb_get_target_status(buf, CONF_NAME_LEN - 1, "alpha"); }), ERR_PARAM);
+    EXPECT_EQ(logged([&] { return xmldb_get_target_status(buf, CONF_NAME_LEN - 1, "alpha"); },
+                     "parameter length error"),
+              ERR_PARAM);
     put(tpath(2, "tpgt"), "");
     EXPECT_EQ(quiet([&] { return xmldb_get_target_tpgt(&v, "beta"); }), ERR_INT_VALUE);
 
@@ -155,132 +91,50 @@ TEST_F(TargetFields, ReadAndWriteByNameIncludingChap)
     EXPECT_EQ(quiet([&] { return xmldb_set_target_chap(2, "u", "p", "alpha"); }), ERR_PARAM);
     EXPECT_EQ(quiet([&] { return xmldb_set_target_chap(1, "u", "p", "nobody"); }), ERR_NOT_FOUND);
     EXPECT_EQ(raw(tpath(1, "chap_enable")), "0");
-}
-
-using TargetDelete = StoreTest;
-
-TEST_F(TargetDelete, LeavesAGapThatHidesLaterTargetsAndConnectionsGoAlone)
-{
-    put_target(1, "a");
-    put_target(2, "b");
-    put_target(3, "c");
-    put("/iscsi/target/count", "3");
-    EXPECT_EQ(quiet([&] { return xmldb_del_target_by_name("b"); }), KORV_OK);
-    EXPECT_EQ(raw(tpath(2, "iqn")), "");
-    EXPECT_EQ(raw("/iscsi/target/count"), "2");
-    EXPECT_EQ(raw(tpath(3, "name")), "c");
-    EXPECT_EQ(xmldb_check_target_exist("c"), 0);
-    EXPECT_EQ(xmldb_check_target_exist("a"), 1);
-    EXPECT_EQ(xmldb_check_target_exist(""), 0);  // a plain "no", never a truthy code
-    EXPECT_EQ(read_targets(xmldb_get_all_target_conf_lite), "a/1/1");
-    EXPECT_EQ(quiet([&] { return xmldb_del_target_by_name("b"); }), ERR_NOT_FOUND);
 
     // Connection records go alone; the target stays.
-    EXPECT_EQ(xmldb_set_target_conn_info("a", 2, "192.0.2.5", "iqn.1994-05.com.example:init"), KORV_OK);
-    EXPECT_EQ(raw("/iscsi/target/id:1/conn_info/conn:2/ip"), "192.0.2.5");
-    EXPECT_EQ(raw("/iscsi/target/id:1/conn_info/conn:2/iqn"), "iqn.1994-05.com.example:init");
+    EXPECT_EQ(xmldb_set_target_conn_info("alpha", 2, "192.0.2.5", "iqn.1994-05.com.example:init"), KORV_OK);
+    EXPECT_EQ(raw(tpath(1, "conn_info/conn:2/ip")) + " " + raw(tpath(1, "conn_info/conn:2/iqn")),
+              "192.0.2.5 iqn.1994-05.com.example:init");
     EXPECT_EQ(xmldb_set_target_conn_info("zz", 1, "x", "y"), ID_ENTRY_NOT_FOUND);
-    EXPECT_EQ(xmldb_del_target_conn_info("a"), KORV_OK);
-    EXPECT_EQ(raw("/iscsi/target/id:1/conn_info/conn:2/ip"), "");
-    EXPECT_EQ(raw(tpath(1, "name")), "a");
+    EXPECT_EQ(xmldb_del_target_conn_info("alpha"), KORV_OK);
+    EXPECT_EQ(raw(tpath(1, "conn_info/conn:2/ip")) + raw(tpath(1, "name")), "alpha");
+    EXPECT_EQ(xmldb_check_target_exist("alpha"), 1);
+    EXPECT_EQ(xmldb_check_target_exist(""), 0);  // a plain "no", never a truthy code
 }
 
-TEST_F(TargetDelete, RecountCountsAcrossGapsAndRemovesOnlyTheGhostAtCountPlusOne)
-{
-    // Four targets (1, 2, 4, 6), one of them running; a ghost at 5, another further on.
-    const char *status[] = {"Ready", "Inactive", nullptr, "No Existence", "Ready", nullptr, "Ready"};
-    for (int n : {1, 2, 4, 6})
-        put_target(n, "t" + std::to_string(n));
-    for (int n = 1; n <= 7; n++)
-        if (status[n - 1])
-            put(tpath(n, "status"), status[n - 1]);
-    put("/iscsi/target/count", "17");
-    std::string out;
-    g_korv_debug_level = 1;
-    EXPECT_EQ(quiet([&] { return xmldb_update_current_targetcnt(); }, &out), KORV_OK);
-    g_korv_debug_level = 0;
-    EXPECT_EQ(raw("/iscsi/target/count") + "/" + raw("/iscsi/target/running_count"), "4/1");
-    EXPECT_NE(out.find("discover and remove ghost entry at PATH: /iscsi/target/id:5"), std::string::npos) << out;
-    EXPECT_EQ(raw(tpath(5, "status")), "");
-    EXPECT_EQ(raw(tpath(7, "status")), "Ready");
-    EXPECT_EQ(raw(tpath(4, "name")) + raw(tpath(6, "name")), "t4t6");
-
-    // After a middle delete, count + 1 is a real target: its status does not make it a ghost.
-    EXPECT_EQ(xmldb_clean_target_conf(), KORV_OK);
-    for (int n : {1, 2, 3}) {
-        put_target(n, "t" + std::to_string(n));
-        put(tpath(n, "status"), "Ready");
-    }
-    EXPECT_EQ(quiet([] { return xmldb_del_target_by_name("t2"); }), KORV_OK);
-    EXPECT_EQ(quiet([] { return xmldb_update_current_targetcnt(); }), KORV_OK);
-    EXPECT_EQ(raw(tpath(3, "name")) + raw(tpath(3, "iqn")), "t3iqn.2000-01.com.example:t3");
-}
-
-using TargetRead = StoreTest;
-
-TEST_F(TargetRead, LiteReadsNamesAndTagsUpToTheFirstGap)
-{
-    EXPECT_EQ(read_targets(xmldb_get_all_target_conf_lite), "");
-    put_target(1, "a", 3);
-    put_target(2, "b", 4);
-    put_target(4, "d", 5);
-    EXPECT_EQ(read_targets(iscsi_conf_ops.xmldb_get_all_target_conf_lite), "a/3/1 b/4/2");
-}
-
-TEST_F(TargetRead, BrokenRecordsAreSkippedAndOnlyADeadServiceFailsTheRead)
+TEST_F(Targets, ReadersSkipBrokenRecordsAndFillEveryFieldChapOnlyWhenOn)
 {
     // A name too long for the record is never cut (the cut name could be
-    // another target's); an unreadable tag costs only its own record.
+    // another target's); an unreadable tag costs only its own record; the
+    // list ends at the first gap.
     put_target(1, "a");
+    put(tpath(1, "chap_name"), "stale");  // CHAP off: not read
+    put(tpath(1, "status"), "Ready");
     put_target(2, std::string(CONF_NAME_LEN, 'n'));
     put_target(3, std::string(CONF_NAME_LEN - 1, 'n'));
     put_target(4, "b");
     put(tpath(4, "tpgt"), "");
-    put_target(5, "c");
-    std::string out;
+    ASSERT_EQ(xmldb_add_new_target(new_target("c", 1).get()), KORV_OK);  // entry 5
+    put_target(7, "after-the-gap");
     const std::string good = "a/1/1 " + std::string(CONF_NAME_LEN - 1, 'n') + "/1/3 c/1/5";
-    EXPECT_EQ(read_targets(xmldb_get_all_target_conf_lite, &out), good);
-    EXPECT_NE(out.find("get tpgt error"), std::string::npos) << out;
-    EXPECT_NE(out.find("/iscsi/target/id:2/name is too long"), std::string::npos) << out;
-    EXPECT_EQ(read_targets(xmldb_get_all_target_conf), good);
-    target_conf_t *t = target_conf_new();
-    EXPECT_EQ(quiet([&] { return xmldb_get_target_conf_by_name(t, raw(tpath(2, "name")).c_str()); }), ERR_PARAM);
-    target_conf_free(t);
+    std::string log;
+    EXPECT_EQ(records<target_conf_t>(xmldb_get_all_target_conf_lite, target_conf_free_list, KORV_OK, &log), good);
+    EXPECT_NE(log.find("/iscsi/target/id:2/name is too long"), std::string::npos) << log;
+    EXPECT_EQ(records<target_conf_t>(iscsi_conf_ops.xmldb_get_all_target_conf, target_conf_free_list, KORV_OK, &log),
+              good);
+    EXPECT_NE(log.find("get target tpgt error"), std::string::npos) << log;
 
-    db().kill();
-    list_t list;
-    list_init(&list);
-    EXPECT_EQ(quiet([&] { return xmldb_get_all_target_conf_lite(&list); }), ERR_DB_CLIENT);
-    EXPECT_EQ(quiet([&] { return xmldb_get_all_target_conf(&list); }), ERR_DB_CLIENT);
-    EXPECT_TRUE(list_is_empty(&list));
-}
-
-TEST_F(TargetRead, FullReadFillsEveryFieldAndChapOnlyWhenOn)
-{
-    target_conf_t *t = filled_target("a", 1);
-    ASSERT_EQ(xmldb_add_new_target(t), KORV_OK);
-    target_conf_free(t);
-    put_target(2, "b");
-    put(tpath(2, "chap_name"), "stale");  // CHAP off: not read
-    put(tpath(2, "status"), "Ready");
-
-    list_t list;
-    list_init(&list);
-    ASSERT_EQ(xmldb_get_all_target_conf(&list), KORV_OK);
-    ASSERT_EQ(list.count, 2);
-    auto *a = static_cast<target_conf_t *>(list.head->owner);
-    auto *b = static_cast<target_conf_t *>(list.tail->owner);
-    EXPECT_STREQ(a->iqn, "iqn.2000-01.com.example:a");
-    EXPECT_EQ(a->chap_enable + a->hba_id + a->state, 1);
-    EXPECT_EQ(std::string(a->chap_name) + "/" + a->chap_pwd, "user/secret12345678");
-    EXPECT_EQ(std::to_string(b->chap_enable) + b->chap_name + "/" + b->status, "0/Ready");
-    target_conf_free_list(&list);
-
-    target_conf_t *one = target_conf_new();
-    EXPECT_EQ(xmldb_get_target_conf_by_name(one, "b"), KORV_OK);
-    EXPECT_EQ(one->dbidx, 2);
-    EXPECT_EQ(quiet([&] { return xmldb_get_target_conf_by_name(one, "zz"); }), ERR_NOT_FOUND);
-    target_conf_free(one);
+    target_ptr one(target_conf_new(), target_conf_free);
+    EXPECT_EQ(xmldb_get_target_conf_by_name(one.get(), "c"), KORV_OK);
+    EXPECT_EQ(std::string(one->iqn) + " " + one->chap_name + "/" + one->chap_pwd + " " + std::to_string(one->dbidx),
+              "iqn.2000-01.com.example:c user/secret12345678 5");
+    one.reset(target_conf_new());
+    EXPECT_EQ(xmldb_get_target_conf_by_name(one.get(), "a"), KORV_OK);
+    EXPECT_EQ(std::to_string(one->chap_enable) + one->chap_name + "/" + one->status, "0/Ready");
+    EXPECT_EQ(quiet([&] { return xmldb_get_target_conf_by_name(one.get(), "zz"); }), ERR_NOT_FOUND);
+    EXPECT_EQ(quiet([&] { return xmldb_get_target_conf_by_name(one.get(), raw(tpath(2, "name")).c_str()); }),
+              ERR_PARAM);
 
     EXPECT_EQ(xmldb_clean_target_conf(), KORV_OK);
     EXPECT_EQ(raw(tpath(1, "name")) + raw("/iscsi/target/count"), "");
