@@ -13,7 +13,10 @@
 
 #include "common/korvadm_err.h"
 #include "common/korvadm_list.h"
+#include "common/korvadm_log.h"
 #include "config/korvadm_conf.h"
+#include "config/korvadm_xmldb_conf.h"
+#include "config/korvadm_xmldb_conf_internal.h"
 #include "platform/xmldbc.h"
 #include "tests/support/capture.h"
 #include "tests/support/xmldbd_fixture.h"
@@ -21,10 +24,7 @@
 namespace korv_test {
 
 // A sample database tree under tests/config/data.
-inline std::string data_file(const char *name)
-{
-    return std::string(KORV_CONFIG_DATA) + "/" + name;
-}
+inline std::string data_file(const char *name) { return std::string(KORV_CONFIG_DATA) + "/" + name; }
 
 // "<root>/id:<n>/<field>"
 inline std::string epath(const std::string &root, int n, const std::string &field)
@@ -32,37 +32,39 @@ inline std::string epath(const std::string &root, int n, const std::string &fiel
     return root + "/id:" + std::to_string(n) + "/" + field;
 }
 
-// fn()'s result, run quietly; its log must hold message.
-template <class Fn>
-int logged(Fn fn, const std::string &message)
+// Values joined with "/", numbers in decimal.
+inline std::string text(const char *s) { return s; }
+inline std::string text(char *s) { return s; }
+inline std::string text(const std::string &s) { return s; }
+template <class T>
+std::string text(T v)
+{
+    return std::to_string(v);
+}
+template <class... A>
+std::string slash(const A &...a)
 {
     std::string out;
-    int rc = quiet(fn, &out);
+    ((out += "/" + text(a)), ...);
+    return out.substr(1);
+}
+
+// fn()'s result, run quietly; its log must hold message.
+template <class Fn>
+auto logged(Fn fn, const std::string &message)
+{
+    std::string out;
+    auto rc = quiet(fn, &out);
     EXPECT_NE(out.find(message), std::string::npos) << "wanted: " << message << "\n" << out;
     return rc;
 }
 
 // One record as text, per kind.
-inline std::string show(const target_conf_t *t)
-{
-    return std::string(t->name) + "/" + std::to_string(t->tpgt) + "/" + std::to_string(t->dbidx);
-}
-inline std::string show(const lun_conf_t *l)
-{
-    return std::string(l->name) + "/" + std::to_string(l->devid) + "/" + std::to_string(l->dbidx);
-}
-inline std::string show(const target_map_lun_conf_t *m)
-{
-    return std::string(m->target_name) + "/" + m->lun_name + "/" + std::to_string(m->lun_num);
-}
-inline std::string show(const acl_initiator_conf_t *a)
-{
-    return std::string(a->initiator) + "/" + a->alias + "/" + std::to_string(a->dbidx);
-}
-inline std::string show(const lun_acl_conf_t *a)
-{
-    return std::string(a->initiator) + "/" + a->alias + "/" + std::to_string(a->access_right);
-}
+inline std::string show(const target_conf_t *t) { return slash(t->name, t->tpgt, t->dbidx); }
+inline std::string show(const lun_conf_t *l) { return slash(l->name, l->devid, l->dbidx); }
+inline std::string show(const target_map_lun_conf_t *m) { return slash(m->target_name, m->lun_name, m->lun_num); }
+inline std::string show(const acl_initiator_conf_t *a) { return slash(a->initiator, a->alias, a->dbidx); }
+inline std::string show(const lun_acl_conf_t *a) { return slash(a->initiator, a->alias, a->access_right); }
 
 // The records a list reader hands out, shown and separated by spaces; the
 // reader must answer want. Its log goes to *log when given.

@@ -3,17 +3,9 @@
 // configuration context and the stored debug level.
 #include <cstdlib>
 #include <cstring>
-#include <string>
-
-#include <gtest/gtest.h>
 
 #include "common/korvadm_debug.h"
-#include "common/korvadm_err.h"
-#include "common/korvadm_log.h"
-#include "config/korvadm_conf.h"
-#include "config/korvadm_xmldb_conf.h"
 #include "tests/config/store_fixture.h"
-#include "tests/support/capture.h"
 
 using namespace korv_test;
 
@@ -58,11 +50,9 @@ using ConfContext = StoreTest;
 TEST_F(ConfContext, GeneratedIqnIsPrefixThenFirstColonSecondCutToTheBuffer)
 {
     char out[CONF_GEN_IQN_LEN + 8];
-    EXPECT_EQ(iscsi_conf_generate_iqn(out, "nas", "t1"), 6);
-    EXPECT_STREQ(out, "nas:t1");
+    EXPECT_EQ(slash(iscsi_conf_generate_iqn(out, "nas", "t1"), out), "6/nas:t1");
     put("/iscsi/target/iqn_prefix", "iqn.2000-01.com.example:");
-    EXPECT_EQ(iscsi_conf_generate_iqn(out, "nas", "t1"), 30);
-    EXPECT_STREQ(out, "iqn.2000-01.com.example:nas:t1");
+    EXPECT_EQ(slash(iscsi_conf_generate_iqn(out, "nas", "t1"), out), "30/iqn.2000-01.com.example:nas:t1");
     EXPECT_EQ(quiet([&] { return iscsi_conf_generate_iqn(out, nullptr, "t1"); }), ERR_PARAM);
 
     std::memset(out, 'Z', sizeof out);
@@ -76,14 +66,13 @@ TEST_F(ConfContext, InitTakesTheHostNameInIqnFormOrFails)
     SysRoot::write("/proc/sys/kernel/hostname", "NAS_Box1\n");
     iscsi_conf_ctx_t ctx;
     std::memset(&ctx, 0x5a, sizeof ctx);
-    ASSERT_EQ(iscsi_conf_init(&ctx), KORV_OK);
-    EXPECT_STREQ(ctx.host_name, "nas-box1");
+    EXPECT_EQ(slash(iscsi_conf_init(&ctx), ctx.host_name), "0/nas-box1");
     EXPECT_EQ(ctx.ops, &iscsi_conf_ops);
 
     SysRoot::remove("/proc/sys/kernel/hostname");
     std::string out;
-    EXPECT_EQ(quiet([&] { return iscsi_conf_init(&ctx); }, &out), ERR_DB_WRITE);
-    EXPECT_EQ(out, "get host name failed\n");
+    EXPECT_EQ(slash(quiet([&] { return iscsi_conf_init(&ctx); }, &out), out),
+              slash(ERR_DB_WRITE, "get host name failed\n"));
 }
 
 TEST_F(ConfContext, StoredDebugLevelBecomesTheProcessLevelWhenReadable)

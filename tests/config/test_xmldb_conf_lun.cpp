@@ -1,12 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 // LUNs: add, the field operations by name and the record readers.
 #include <cstring>
-#include <string>
 
-#include <gtest/gtest.h>
-
-#include "common/korvadm_err.h"
-#include "config/korvadm_xmldb_conf.h"
 #include "tests/config/store_fixture.h"
 
 using namespace korv_test;
@@ -53,20 +48,22 @@ TEST_F(Luns, EachFieldOperationReadsOrWritesItsOwnFieldOfTheNamedLun)
 {
     put(lpath(1, "name"), "a");
     put(lpath(2, "name"), "b");
-    EXPECT_EQ(xmldb_set_lun_serial("S", "b"), KORV_OK);
-    EXPECT_EQ(xmldb_set_lun_vol_state(2, "b"), KORV_OK);
-    EXPECT_EQ(xmldb_set_lun_size(1ULL << 33, "b"), KORV_OK);
-    EXPECT_EQ(xmldb_set_lun_alloc_size(77, "b"), KORV_OK);
-    EXPECT_EQ(xmldb_set_lun_connect_state(1, "b"), KORV_OK);
-    EXPECT_EQ(xmldb_set_lun_prealloc_state(4, "b"), KORV_OK);
-    EXPECT_EQ(xmldb_set_lun_prealloc_progress(100, "b"), KORV_OK);
-    EXPECT_EQ(xmldb_set_lun_status("Ready", "b"), KORV_OK);
-    const char *want[][2] = {{"serial", "S"},       {"vol_state", "2"},      {"size", "8589934592"},
-                             {"alloc_size", "77"},  {"connected", "1"},      {"prealloc_state", "4"},
-                             {"prealloc_progress", "100"}, {"status", "Ready"}};
-    for (auto [field, value] : want) {
-        EXPECT_EQ(raw(lpath(2, field)), value) << field;
-        EXPECT_EQ(raw(lpath(1, field)), "") << field;
+    const struct {
+        const char *field, *stored;
+        int (*set)();
+    } sets[] = {
+        {"serial", "S", [] { return xmldb_set_lun_serial("S", "b"); }},
+        {"vol_state", "2", [] { return xmldb_set_lun_vol_state(2, "b"); }},
+        {"size", "8589934592", [] { return xmldb_set_lun_size(1ULL << 33, "b"); }},
+        {"alloc_size", "77", [] { return xmldb_set_lun_alloc_size(77, "b"); }},
+        {"connected", "1", [] { return xmldb_set_lun_connect_state(1, "b"); }},
+        {"prealloc_state", "4", [] { return xmldb_set_lun_prealloc_state(4, "b"); }},
+        {"prealloc_progress", "100", [] { return xmldb_set_lun_prealloc_progress(100, "b"); }},
+        {"status", "Ready", [] { return xmldb_set_lun_status("Ready", "b"); }},
+    };
+    for (const auto &s : sets) {
+        EXPECT_EQ(s.set(), KORV_OK) << s.field;
+        EXPECT_EQ(raw(lpath(2, s.field)) + "|" + raw(lpath(1, s.field)), std::string(s.stored) + "|");
     }
     put(lpath(2, "uuid"), "vol-9");
     put(lpath(2, "img_file"), "/f.img");
@@ -78,19 +75,15 @@ TEST_F(Luns, EachFieldOperationReadsOrWritesItsOwnFieldOfTheNamedLun)
         got += std::string(buf) + " ";
     }
     EXPECT_EQ(xmldb_get_lun_img_file(buf, 4, "b"), KORV_OK);  // cut to the caller's buffer
-    EXPECT_EQ(got + buf, "vol-9 /f.img S Ready /f.");
-    uint64_t size = 0, alloc = 0;
-    EXPECT_EQ(xmldb_get_lun_size(&size, "b"), KORV_OK);
-    EXPECT_EQ(xmldb_get_lun_alloc_size(&alloc, "b"), KORV_OK);
-    EXPECT_EQ(std::to_string(size) + "/" + std::to_string(alloc), "8589934592/77");
     int v = -1;
-    got.clear();
     for (auto get : {xmldb_get_lun_vol_state, xmldb_get_lun_connect_state, xmldb_get_lun_prealloc,
                      xmldb_get_lun_prealloc_state}) {
         EXPECT_EQ(get(&v, "b"), KORV_OK);
         got += std::to_string(v);
     }
-    EXPECT_EQ(got, "2114");
+    uint64_t size = 0, alloc = 0;
+    EXPECT_EQ(xmldb_get_lun_size(&size, "b") + xmldb_get_lun_alloc_size(&alloc, "b"), KORV_OK);
+    EXPECT_EQ(slash(got + buf, size, alloc), "vol-9 /f.img S Ready 2114/f./8589934592/77");
     EXPECT_EQ(quiet([&] { return xmldb_get_lun_vol_state(&v, "a"); }), ERR_INT_VALUE);
 }
 
@@ -136,24 +129,21 @@ TEST_F(Luns, RecordsCarryEveryFieldOrItsUnknownValue)
     ASSERT_EQ(quiet([&] { return xmldb_get_all_lun_conf(list.get()); }), KORV_OK);
     ASSERT_EQ(list.get()->count, 2);
     auto *a = static_cast<lun_conf_t *>(list.get()->head->owner);
-    auto *bare = static_cast<lun_conf_t *>(list.get()->tail->owner);
-    EXPECT_EQ(std::string(a->uuid) + "/" + a->serial + "/" + a->img_file + "/" + a->target_name,
-              "vol-a/sn-a//mnt/v/a.img/t1");
-    EXPECT_EQ(std::to_string(a->size) + "/" + std::to_string(a->alloc_size), "8192/4096");
-    EXPECT_EQ(std::to_string(a->devid) + std::to_string(a->prealloc) + std::to_string(a->prealloc_state) +
-                  std::to_string(a->vol_state) + std::to_string(a->connected) + std::to_string(a->lun_num),
-              "312117");
-    EXPECT_EQ(std::to_string(bare->size) + std::to_string(bare->alloc_size) + std::to_string(bare->prealloc), "000");
-    for (int unknown : {bare->devid, bare->prealloc_state, bare->vol_state, bare->connected, bare->lun_num})
-        EXPECT_EQ(unknown, -1);
+    auto *b = static_cast<lun_conf_t *>(list.get()->tail->owner);
+    EXPECT_EQ(slash(a->uuid, a->serial, a->img_file, a->target_name, a->size, a->alloc_size),
+              "vol-a/sn-a//mnt/v/a.img/t1/8192/4096");
+    EXPECT_EQ(slash(a->devid, a->prealloc, a->prealloc_state, a->vol_state, a->connected, a->lun_num), "3/1/2/1/1/7");
+    EXPECT_EQ(slash(b->size, b->alloc_size, b->prealloc, b->devid, b->prealloc_state, b->vol_state, b->connected,
+                    b->lun_num),
+              "0/0/0/-1/-1/-1/-1/-1");
 
     EXPECT_EQ(records<lun_conf_t>(xmldb_get_all_lun_conf_in_crash_conf, lun_conf_free_list), "a/3/1 bare/-1/2");
     EXPECT_EQ(records<lun_conf_t>(xmldb_get_all_lun_conf_lite, lun_conf_free_list), "a/-1/1 bare/-1/2");
     lun_ptr one(lun_conf_new(), lun_conf_free);
     EXPECT_EQ(xmldb_get_lun_conf_by_uuid(one.get(), "vol-a"), KORV_OK);
-    EXPECT_EQ(std::string(one->name) + "/" + std::to_string(one->lun_num), "a/7");
+    EXPECT_EQ(slash(one->name, one->lun_num), "a/7");
     EXPECT_EQ(xmldb_get_lun_conf_by_name(one.get(), "bare"), KORV_OK);
-    EXPECT_EQ(std::string(one->name) + "/" + std::to_string(one->dbidx), "bare/2");
+    EXPECT_EQ(slash(one->name, one->dbidx), "bare/2");
     EXPECT_EQ(quiet([&] { return xmldb_get_lun_conf_by_uuid(one.get(), "vol-zz"); }), ERR_NOT_FOUND);
     EXPECT_EQ(quiet([&] { return xmldb_get_lun_conf_by_name(one.get(), "zz"); }), ERR_NOT_FOUND);
 }

@@ -2,14 +2,7 @@
 // The numbered-entry scanner and the counters, the rules every keyed list
 // shares (capacity, free numbers, delete, recount, whole-read failure), and
 // what the store makes of full tables and of a store another writer corrupted.
-#include <string>
 
-#include <gtest/gtest.h>
-
-#include "common/korvadm_err.h"
-#include "common/korvadm_log.h"
-#include "config/korvadm_xmldb_conf.h"
-#include "config/korvadm_xmldb_conf_internal.h"
 #include "tests/config/store_fixture.h"
 
 using namespace korv_test;
@@ -21,23 +14,21 @@ TEST_F(IdEntryScan, MatchesWholeValuesUpToTheLimitAndAnEmptyKeyHidesTheRest)
     put("/l/id:1/name", "a");
     put("/l/id:2/name", "");
     put("/l/id:3/name", "c");
-    int id = -1;
-    EXPECT_EQ(_search_xmldb_id_entry(&id, "/l", 10, "name", "a"), ID_ENTRY_FOUND);
-    EXPECT_EQ(id, 1);
-    EXPECT_EQ(_search_xmldb_id_entry(&id, "/l", 10, "name", "c"), ID_ENTRY_NOT_FOUND);
-    EXPECT_EQ(id, 0);
-    EXPECT_EQ(_cal_xmldb_id_entry_count("/l", 10, "name"), 1);
-    EXPECT_EQ(_get_free_xmldb_id_entry(&id, "/l", 10, "name"), ID_ENTRY_FOUND);
-    EXPECT_EQ(id, 2);
+    int found = -1, free = -1;
+    EXPECT_EQ(_search_xmldb_id_entry(&found, "/l", 10, "name", "a"), ID_ENTRY_FOUND);
+    EXPECT_EQ(_get_free_xmldb_id_entry(&free, "/l", 10, "name"), ID_ENTRY_FOUND);
+    EXPECT_EQ(slash(found, free, _cal_xmldb_id_entry_count("/l", 10, "name")), "1/2/1");
+    EXPECT_EQ(_search_xmldb_id_entry(&found, "/l", 10, "name", "c"), ID_ENTRY_NOT_FOUND);
+    EXPECT_EQ(found, 0);
 
     // Whole values only, and never past the limit.
     put("/l/id:2/name", "abc");
-    EXPECT_EQ(_search_xmldb_id_entry(&id, "/l", 10, "name", "ab"), ID_ENTRY_NOT_FOUND);
-    EXPECT_EQ(_search_xmldb_id_entry(&id, "/l", 2, "name", "c"), ID_ENTRY_NOT_FOUND);
-    EXPECT_EQ(_search_xmldb_id_entry(&id, "/l", 3, "name", "c"), ID_ENTRY_FOUND);
-    EXPECT_EQ(_cal_xmldb_id_entry_count("/l", 2, "name"), 2);
-    EXPECT_EQ(_get_free_xmldb_id_entry(&id, "/l", 3, "name"), ID_ENTRY_NOT_FOUND);
-    EXPECT_EQ(quiet([&] { return _search_xmldb_id_entry(&id, nullptr, 10, "name", "a"); }), ERR_PARAM);
+    EXPECT_EQ(_search_xmldb_id_entry(&found, "/l", 10, "name", "ab"), ID_ENTRY_NOT_FOUND);
+    EXPECT_EQ(_search_xmldb_id_entry(&found, "/l", 2, "name", "c"), ID_ENTRY_NOT_FOUND);
+    EXPECT_EQ(_search_xmldb_id_entry(&found, "/l", 3, "name", "c"), ID_ENTRY_FOUND);
+    EXPECT_EQ(slash(_cal_xmldb_id_entry_count("/l", 2, "name"), _get_free_xmldb_id_entry(&free, "/l", 3, "name")),
+              slash(2, ID_ENTRY_NOT_FOUND));
+    EXPECT_EQ(quiet([&] { return _search_xmldb_id_entry(&found, nullptr, 10, "name", "a"); }), ERR_PARAM);
 
     // Counters never go below zero; a negative one counts as 0.
     put("/iscsi/lun/count", "-5");
@@ -164,20 +155,18 @@ TEST_F(HostileStore, CountsAreBoundedAndBrokenRecordsSkippedEverywhere)
               "iqn.a/a/2");
     EXPECT_EQ(records<acl_initiator_conf_t>(xmldb_get_all_acl_initiator_conf_lite, acl_initiator_conf_free_list),
               "iqn.a/a/1 iqn.c/" + std::string(127, 'x') + "/3");
+    int num = -1, devid = -1;
+    EXPECT_EQ(quiet([&] { return xmldb_get_free_lun_num(&num, "t1") + xmldb_get_free_lun_devid(&devid); }), KORV_OK);
+    EXPECT_EQ(slash(num, devid), "1/0");
 
-    int num = -1;
-    EXPECT_EQ(quiet([&] { return xmldb_get_free_lun_num(&num, "t1"); }), KORV_OK);
-    EXPECT_EQ(num, 1);
-    EXPECT_EQ(quiet([&] { return xmldb_get_free_lun_devid(&num); }), KORV_OK);
-    EXPECT_EQ(num, 0);
     EXPECT_EQ(quiet([] { return xmldb_set_lun_acl("iqn.new", "n", "l1", 1); }), KORV_OK);
-    EXPECT_EQ(raw("/iscsi/lun/id:1/acl/id:4/initiator") + raw("/iscsi/lun/id:1/acl/count"), "iqn.new4");
     EXPECT_EQ(quiet([] { return xmldb_update_sess_acl_lun_access_status("iqn.a", "l1", 1); }), KORV_OK);
-    EXPECT_EQ(raw("/iscsi/sess/initiator/id:1/access_lun/count"), "1");
+    EXPECT_EQ(slash(raw(lpath(1, "acl/id:4/initiator")), raw(lpath(1, "acl/count")),
+                    raw("/iscsi/sess/initiator/id:1/access_lun/count")),
+              "iqn.new/4/1");
     EXPECT_EQ(quiet([] { return xmldb_del_acl_initiator("iqn.a"); }), KORV_OK);
-    EXPECT_EQ(raw("/iscsi/lun/id:1/acl/id:1/initiator"), "iqn.new");
-    EXPECT_EQ(quiet([] { return xmldb_remove_lun_from_all_acl("l1"); }), KORV_OK);
-    EXPECT_EQ(quiet([] { return xmldb_update_lun_current_count(); }), KORV_OK);
+    EXPECT_EQ(raw(lpath(1, "acl/id:1/initiator")), "iqn.new");
+    EXPECT_EQ(quiet([] { return xmldb_remove_lun_from_all_acl("l1") + xmldb_update_lun_current_count(); }), KORV_OK);
     EXPECT_EQ(raw("/iscsi/lun/count"), "3");
 }
 
@@ -197,18 +186,13 @@ TEST_F(FullStore, EveryReaderReturnsEveryRecordOfFullTables)
     for (int a = 4; a <= 129; a++)
         ASSERT_EQ(xmldb_add_acl_initiator(("iqn.n" + std::to_string(a)).c_str(), "n"), KORV_OK) << a;
 
-    korv::list_owner luns(lun_conf_free_list);
-    ASSERT_EQ(xmldb_get_all_lun_conf(luns.get()), KORV_OK);
-    ASSERT_EQ(luns.get()->count, 128);
-    auto *last = static_cast<lun_conf_t *>(luns.get()->tail->owner);
-    EXPECT_EQ(std::string(last->target_name) + ":" + std::to_string(last->lun_num), "t2:64");
-    korv::list_owner map(target_map_lun_conf_free_list), acl(lun_acl_conf_free_list),
+    korv::list_owner luns(lun_conf_free_list), map(target_map_lun_conf_free_list), acl(lun_acl_conf_free_list),
         initiators(acl_initiator_conf_free_list);
+    ASSERT_EQ(xmldb_get_all_lun_conf(luns.get()), KORV_OK);
     ASSERT_EQ(xmldb_get_target_map_lun_conf("t2", map.get()), KORV_OK);
     ASSERT_EQ(xmldb_get_all_lun_acl_conf_from_lun("l128", acl.get()), KORV_OK);
     ASSERT_EQ(xmldb_get_all_acl_initiator_conf_lite(initiators.get()), KORV_OK);
-    EXPECT_EQ(std::to_string(map.get()->count) + "/" + std::to_string(acl.get()->count) + "/" +
-                  std::to_string(initiators.get()->count),
-              "64/3/129");
-    EXPECT_EQ(raw("/iscsi/acl/id:2/mapped_lun/count"), "128");
+    EXPECT_EQ(slash(luns.get()->count, map.get()->count, acl.get()->count, initiators.get()->count), "128/64/3/129");
+    auto *last = static_cast<lun_conf_t *>(luns.get()->tail->owner);
+    EXPECT_EQ(slash(last->target_name, last->lun_num, raw("/iscsi/acl/id:2/mapped_lun/count")), "t2/64/128");
 }

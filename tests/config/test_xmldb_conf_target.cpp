@@ -2,12 +2,7 @@
 // Targets: add, the field operations by name, connection records, and the
 // record readers.
 #include <cstring>
-#include <string>
 
-#include <gtest/gtest.h>
-
-#include "common/korvadm_err.h"
-#include "config/korvadm_xmldb_conf.h"
 #include "tests/config/store_fixture.h"
 
 using namespace korv_test;
@@ -63,16 +58,14 @@ TEST_F(Targets, FieldsAreReadAndWrittenByNameIncludingChapAndConnections)
     put_target(1, "alpha", 2, 4);
     put_target(2, "beta", 5, 6);
     int v = 0;
-    EXPECT_EQ(xmldb_get_target_tpgt(&v, "beta"), KORV_OK);
-    EXPECT_EQ(v, 5);
+    EXPECT_EQ(slash(xmldb_get_target_tpgt(&v, "beta"), v), "0/5");
     EXPECT_EQ(xmldb_set_target_state(9, "beta"), KORV_OK);
     EXPECT_EQ(xmldb_set_target_hba_id(11, "alpha"), KORV_OK);
     EXPECT_EQ(xmldb_set_target_status("Ready", "alpha"), KORV_OK);
     EXPECT_EQ(xmldb_set_target_iqn("iqn.2000-01.com.example:new", "alpha"), KORV_OK);
-    EXPECT_EQ(raw(tpath(2, "state")) + raw(tpath(1, "hba_id")) + raw(tpath(1, "status")), "911Ready");
+    EXPECT_EQ(slash(raw(tpath(2, "state")), raw(tpath(1, "hba_id")), raw(tpath(1, "status"))), "9/11/Ready");
     char buf[CONF_IQN_LEN];
-    EXPECT_EQ(xmldb_get_target_iqn(buf, sizeof buf, "alpha"), KORV_OK);
-    EXPECT_STREQ(buf, "iqn.2000-01.com.example:new");
+    EXPECT_EQ(slash(xmldb_get_target_iqn(buf, sizeof buf, "alpha"), buf), "0/iqn.2000-01.com.example:new");
 
     // A missing name is "not found" except for the IQN, which reports a parameter error.
     EXPECT_EQ(quiet([&] { return xmldb_set_target_state(1, "gamma"); }), ERR_NOT_FOUND);
@@ -84,39 +77,39 @@ TEST_F(Targets, FieldsAreReadAndWrittenByNameIncludingChapAndConnections)
     EXPECT_EQ(quiet([&] { return xmldb_get_target_tpgt(&v, "beta"); }), ERR_INT_VALUE);
 
     // The CHAP switch writes or clears the credentials; a bad switch writes nothing.
+    auto chap = [&] {
+        return slash(raw(tpath(1, "chap_enable")), raw(tpath(1, "chap_name")), raw(tpath(1, "chap_pwd")));
+    };
     EXPECT_EQ(xmldb_set_target_chap(1, "u", "pw", "alpha"), KORV_OK);
-    EXPECT_EQ(raw(tpath(1, "chap_enable")) + raw(tpath(1, "chap_name")) + raw(tpath(1, "chap_pwd")), "1upw");
+    EXPECT_EQ(chap(), "1/u/pw");
     EXPECT_EQ(xmldb_set_target_chap(0, "ignored", "ignored", "alpha"), KORV_OK);
-    EXPECT_EQ(raw(tpath(1, "chap_enable")) + raw(tpath(1, "chap_name")) + raw(tpath(1, "chap_pwd")), "0");
     EXPECT_EQ(quiet([&] { return xmldb_set_target_chap(2, "u", "p", "alpha"); }), ERR_PARAM);
     EXPECT_EQ(quiet([&] { return xmldb_set_target_chap(1, "u", "p", "nobody"); }), ERR_NOT_FOUND);
-    EXPECT_EQ(raw(tpath(1, "chap_enable")), "0");
+    EXPECT_EQ(chap(), "0//");
 
     // Connection records go alone; the target stays.
     EXPECT_EQ(xmldb_set_target_conn_info("alpha", 2, "192.0.2.5", "iqn.1994-05.com.example:init"), KORV_OK);
-    EXPECT_EQ(raw(tpath(1, "conn_info/conn:2/ip")) + " " + raw(tpath(1, "conn_info/conn:2/iqn")),
-              "192.0.2.5 iqn.1994-05.com.example:init");
+    EXPECT_EQ(slash(raw(tpath(1, "conn_info/conn:2/ip")), raw(tpath(1, "conn_info/conn:2/iqn"))),
+              "192.0.2.5/iqn.1994-05.com.example:init");
     EXPECT_EQ(xmldb_set_target_conn_info("zz", 1, "x", "y"), ID_ENTRY_NOT_FOUND);
     EXPECT_EQ(xmldb_del_target_conn_info("alpha"), KORV_OK);
-    EXPECT_EQ(raw(tpath(1, "conn_info/conn:2/ip")) + raw(tpath(1, "name")), "alpha");
-    EXPECT_EQ(xmldb_check_target_exist("alpha"), 1);
-    EXPECT_EQ(xmldb_check_target_exist(""), 0);  // a plain "no", never a truthy code
+    EXPECT_EQ(slash(raw(tpath(1, "conn_info/conn:2/ip")), raw(tpath(1, "name")), xmldb_check_target_exist("alpha"),
+                    xmldb_check_target_exist("")),  // "": a plain "no", never a truthy code
+              "/alpha/1/0");
 }
 
-TEST_F(Targets, ReadersSkipBrokenRecordsAndFillEveryFieldChapOnlyWhenOn)
+namespace {
+class BrokenTargets : public StoreTest {
+protected:
+    BrokenTargets() : StoreTest(data_file("targets_broken.xml")) {}
+};
+}  // namespace
+
+TEST_F(BrokenTargets, ReadersSkipBrokenRecordsAndFillEveryFieldChapOnlyWhenOn)
 {
     // A name too long for the record is never cut (the cut name could be
     // another target's); an unreadable tag costs only its own record; the
-    // list ends at the first gap.
-    put_target(1, "a");
-    put(tpath(1, "chap_name"), "stale");  // CHAP off: not read
-    put(tpath(1, "status"), "Ready");
-    put_target(2, std::string(CONF_NAME_LEN, 'n'));
-    put_target(3, std::string(CONF_NAME_LEN - 1, 'n'));
-    put_target(4, "b");
-    put(tpath(4, "tpgt"), "");
-    ASSERT_EQ(xmldb_add_new_target(new_target("c", 1).get()), KORV_OK);  // entry 5
-    put_target(7, "after-the-gap");
+    // list ends at the first gap; CHAP credentials are read only when on.
     const std::string good = "a/1/1 " + std::string(CONF_NAME_LEN - 1, 'n') + "/1/3 c/1/5";
     std::string log;
     EXPECT_EQ(records<target_conf_t>(xmldb_get_all_target_conf_lite, target_conf_free_list, KORV_OK, &log), good);
@@ -127,11 +120,11 @@ TEST_F(Targets, ReadersSkipBrokenRecordsAndFillEveryFieldChapOnlyWhenOn)
 
     target_ptr one(target_conf_new(), target_conf_free);
     EXPECT_EQ(xmldb_get_target_conf_by_name(one.get(), "c"), KORV_OK);
-    EXPECT_EQ(std::string(one->iqn) + " " + one->chap_name + "/" + one->chap_pwd + " " + std::to_string(one->dbidx),
-              "iqn.2000-01.com.example:c user/secret12345678 5");
+    EXPECT_EQ(slash(one->iqn, one->chap_name, one->chap_pwd, one->dbidx),
+              "iqn.2000-01.com.example:c/user/secret12345678/5");
     one.reset(target_conf_new());
     EXPECT_EQ(xmldb_get_target_conf_by_name(one.get(), "a"), KORV_OK);
-    EXPECT_EQ(std::to_string(one->chap_enable) + one->chap_name + "/" + one->status, "0/Ready");
+    EXPECT_EQ(slash(one->chap_enable, one->chap_name, one->status), "0//Ready");
     EXPECT_EQ(quiet([&] { return xmldb_get_target_conf_by_name(one.get(), "zz"); }), ERR_NOT_FOUND);
     EXPECT_EQ(quiet([&] { return xmldb_get_target_conf_by_name(one.get(), raw(tpath(2, "name")).c_str()); }),
               ERR_PARAM);

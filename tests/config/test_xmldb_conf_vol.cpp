@@ -6,11 +6,7 @@
 #include <fstream>
 #include <sstream>
 
-#include <gtest/gtest.h>
-
-#include "common/korvadm_err.h"
 #include "common/korvadm_sys.h"
-#include "config/korvadm_xmldb_conf.h"
 #include "tests/config/store_fixture.h"
 
 using korv_test::quiet;
