@@ -1,10 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
 // Mapping LUNs into targets: both sides of a mapping, free LUN numbers, and
 // what a failed mapping leaves.
-#include <csignal>
 #include <sys/socket.h>
 #include <sys/un.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include "tests/config/store_fixture.h"
@@ -25,7 +23,7 @@ public:
         ::unlink(at.sun_path);
         EXPECT_EQ(::bind(fd, reinterpret_cast<const sockaddr *>(&at), sizeof at), 0);
         EXPECT_EQ(::listen(fd, 4), 0);
-        if ((pid_ = ::fork()) == 0) {
+        proc_.start([=] {
             const sockaddr_un to = address(upstream);
             for (int c, sets = 0; (c = ::accept(fd, nullptr, nullptr)) >= 0; ::close(c)) {
                 const int up = ::socket(AF_UNIX, SOCK_STREAM, 0);
@@ -38,14 +36,9 @@ public:
                 }
                 ::close(up);
             }
-            ::_exit(0);
-        }
+            return 0;
+        });
         ::close(fd);
-    }
-    ~RefusingProxy()
-    {
-        ::kill(pid_, SIGKILL);
-        ::waitpid(pid_, nullptr, 0);
     }
 
 private:
@@ -65,7 +58,7 @@ private:
         out.assign(reinterpret_cast<char *>(h), 4).resize(4 + len);
         return ::recv(fd, out.data() + 4, len, MSG_WAITALL) == static_cast<ssize_t>(len);
     }
-    pid_t pid_ = -1;
+    child_process proc_;  // stopped with the proxy
 };
 
 class Mapping : public StoreTest {
