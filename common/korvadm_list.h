@@ -45,7 +45,32 @@ void list_release(list_t *list, void (*free_fn)(void *record));
 #ifdef __cplusplus
 }
 
+#include <cstdlib>
+
 namespace korv {
+
+/* A record kind's *_new and *_free: a zeroed record whose list node (the
+ * member node_of) is owned by itself, nullptr when memory is short; freeing
+ * unlinks it first, and a NULL record is nothing to free.
+ *
+ *   iscsi_ip_t *ip = korv::list_record_new(&iscsi_ip_t::node); */
+template <class T>
+T *list_record_new(list_node_t T::*node_of)
+{
+    auto *rec = static_cast<T *>(std::calloc(1, sizeof(T)));
+    if (rec)
+        list_node_init(&(rec->*node_of), rec);
+    return rec;
+}
+
+template <class T>
+void list_record_free(T *rec, list_node_t T::*node_of)
+{
+    if (!rec)
+        return;
+    list_remove(&(rec->*node_of));
+    std::free(rec);
+}
 
 /* Range over the records of a list: for (T *rec : list_records<T>(&list)).
  * Steps before yielding, so the current record may be freed in the body. */

@@ -18,7 +18,7 @@
 
 iscsi_ip_t *iscsi_ip_new(void)
 {
-    auto *ip = static_cast<iscsi_ip_t *>(std::calloc(1, sizeof(iscsi_ip_t)));
+    iscsi_ip_t *ip = korv::list_record_new(&iscsi_ip_t::node);
     if (!ip) {
         DBG(0, "malloc iscsi_ip_t failed");
         return nullptr;
@@ -26,16 +26,12 @@ iscsi_ip_t *iscsi_ip_new(void)
     ip->tag1 = -1;
     ip->tag2 = -1;
     ip->port = -1;
-    list_node_init(&ip->node, ip);
     return ip;
 }
 
 void iscsi_ip_free(iscsi_ip_t *ip)
 {
-    if (!ip)
-        return;
-    list_remove(&ip->node);
-    std::free(ip);
+    korv::list_record_free(ip, &iscsi_ip_t::node);
 }
 
 void iscsi_ip_free_list(list_t *list)

@@ -197,21 +197,15 @@ std::string_view next_field(std::string_view &line)
 
 vol_info_t *vol_info_new(void)
 {
-    auto *vol = static_cast<vol_info_t *>(std::calloc(1, sizeof(vol_info_t)));
-    if (!vol) {
+    vol_info_t *vol = korv::list_record_new(&vol_info_t::node);
+    if (!vol)
         DBG(0, "malloc vol_info_t failed");
-        return nullptr;
-    }
-    list_node_init(&vol->node, vol);
     return vol;
 }
 
 void vol_info_free(vol_info_t *vol)
 {
-    if (!vol)
-        return;
-    list_remove(&vol->node);
-    std::free(vol);
+    korv::list_record_free(vol, &vol_info_t::node);
 }
 
 void vol_info_free_list(list_t *list)

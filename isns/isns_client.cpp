@@ -115,8 +115,7 @@ int register_node(isns_iscsi_node *node)
 
 int deregister_entity(const char *name)
 {
-    if (isns_trace)
-        puts("deregister_entity()");
+    _isns_tracef("deregister_entity()\n");
     emit_hdr(ISNS_DEV_DEREG);
     emit_attr(ISNS_TAG_ISCSI_NAME, name ? name : "");
     emit_delimiter();
@@ -191,17 +190,15 @@ int _isns_check_result(const char *name, int r)
             const char *v = reinterpret_cast<const char *>(a.value);
             const std::string_view got(v, strnlen(v, a.len));
             if (got == want) {
-                if (isns_trace)
-                    puts("iscsi name matched.");
+                _isns_tracef("iscsi name matched.\n");
                 matched = true;
                 return false;
             }
-            if (isns_trace)
-                printf("get iSCSI name = %.*s , length = %d\n", static_cast<int>(got.size()), got.data(),
-                       static_cast<int>(a.len));
-        } else if (isns_trace) {
-            printf("get tag = %02x%02x%02x%02x , length = %d\n", a.tag >> 24, (a.tag >> 16) & 0xff,
-                   (a.tag >> 8) & 0xff, a.tag & 0xff, static_cast<int>(a.len));
+            _isns_tracef("get iSCSI name = %.*s , length = %d\n", static_cast<int>(got.size()), got.data(),
+                         static_cast<int>(a.len));
+        } else {
+            _isns_tracef("get tag = %02x%02x%02x%02x , length = %d\n", a.tag >> 24, (a.tag >> 16) & 0xff,
+                         (a.tag >> 8) & 0xff, a.tag & 0xff, static_cast<int>(a.len));
         }
         return true;
     });

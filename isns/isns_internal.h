@@ -1,13 +1,17 @@
 // SPDX-License-Identifier: Apache-2.0
-/* Steps of an exchange that follow the receive, split out so that the fuzz
- * target can drive them on bytes that never crossed a network. Not part of
- * the installed interface. */
+/* What only the client's own files share: the trace, and the steps of an
+ * exchange that follow the receive, split out so that the fuzz target can
+ * drive them on bytes that never crossed a network. Not part of the
+ * installed interface. */
 #ifndef ISNS_INTERNAL_H
 #define ISNS_INTERNAL_H
 
 #ifdef __cplusplus
 extern "C" {
 #endif
+
+/* printf to standard output, without the log prefix, while isns_trace is on. */
+void _isns_tracef(const char *fmt, ...) __attribute__((format(printf, 1, 2)));
 
 /* n: the result of recv_response() on the response in isns_pdu_buf. Sets
  * isns_last_status; returns n when the status is 0, else -1. */

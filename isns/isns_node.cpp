@@ -2,43 +2,31 @@
 // The node and portal records the registrations are built from.
 #include "isns/isns_node.h"
 
-#include <cstdlib>
-
 #include "common/korvadm_err.h"
 
 isns_ip_portal *isns_ip_portal_new(void)
 {
-    auto *p = static_cast<isns_ip_portal *>(calloc(1, sizeof(isns_ip_portal)));
-    if (p)
-        list_node_init(&p->link, p);
-    return p;
+    return korv::list_record_new(&isns_ip_portal::link);
 }
 
 isns_iscsi_node *isns_iscsi_node_new(void)
 {
-    auto *n = static_cast<isns_iscsi_node *>(calloc(1, sizeof(isns_iscsi_node)));
-    if (n) {
+    isns_iscsi_node *n = korv::list_record_new(&isns_iscsi_node::link);
+    if (n)
         list_init(&n->portals);
-        list_node_init(&n->link, n);
-    }
     return n;
 }
 
 void isns_ip_portal_free(isns_ip_portal *portal)
 {
-    if (!portal)
-        return;
-    list_remove(&portal->link);
-    free(portal);
+    korv::list_record_free(portal, &isns_ip_portal::link);
 }
 
 void isns_iscsi_node_free(isns_iscsi_node *node)
 {
-    if (!node)
-        return;
-    list_release(&node->portals, [](void *p) { isns_ip_portal_free(static_cast<isns_ip_portal *>(p)); });
-    list_remove(&node->link);
-    free(node);
+    if (node)
+        list_release(&node->portals, [](void *p) { isns_ip_portal_free(static_cast<isns_ip_portal *>(p)); });
+    korv::list_record_free(node, &isns_iscsi_node::link);
 }
 
 int isns_iscsi_node_add_portal(isns_iscsi_node *node, isns_ip_portal *portal)

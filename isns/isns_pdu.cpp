@@ -2,16 +2,28 @@
 /* iSNSP encoder: the PDU buffer, the header and one emitter per attribute. */
 #include "isns/isns_pdu.h"
 
+#include <cstdarg>
 #include <cstdio>
 #include <cstring>
 
 #include "common/korvadm_log.h"
+#include "isns/isns_internal.h"
 #include "isns/isns_node.h"
 
 unsigned char isns_pdu_buf[ISNS_PDU_SIZE];
 int isns_trace = 0;
 int isns_alias_on = 0;
 char isns_alias[ISNS_PDU_SIZE];
+
+void _isns_tracef(const char *fmt, ...)
+{
+    if (!isns_trace)
+        return;
+    va_list ap;
+    va_start(ap, fmt);
+    vprintf(fmt, ap);
+    va_end(ap);
+}
 
 namespace {
 
@@ -89,8 +101,7 @@ int isns_pdu_overflowed(void)
 
 void emit_hdr(int func)
 {
-    if (isns_trace)
-        printf("   emit_hdr() func = %d\n", func);
+    _isns_tracef("   emit_hdr() func = %d\n", func);
     const unsigned char hdr[ISNS_HDR_LEN] = {
         0x00, 0x01,                                    /* version */
         0x00, static_cast<unsigned char>(func),        /* function id */
@@ -105,8 +116,7 @@ void emit_hdr(int func)
 
 void emit_attr(int tag, const char *text)
 {
-    if (isns_trace)
-        printf("Tag: %d=%s\n", tag, text ? text : "(null)");
+    _isns_tracef("Tag: %d=%s\n", tag, text ? text : "(null)");
     if (text)
         put_string_attr(tag, text);
     else
@@ -115,43 +125,37 @@ void emit_attr(int tag, const char *text)
 
 void emit_delimiter(void)
 {
-    if (isns_trace)
-        puts(" 0 emit_delimiter()");
+    _isns_tracef(" 0 emit_delimiter()\n");
     put_empty_attr(ISNS_TAG_DELIMITER);
 }
 
 void emit_entity_protocol(int proto)
 {
-    if (isns_trace)
-        printf(" 2 emit_entity_protocol() proto = %d\n", proto);
+    _isns_tracef(" 2 emit_entity_protocol() proto = %d\n", proto);
     put_u32_attr(ISNS_TAG_ENTITY_PROTOCOL, static_cast<unsigned char>(proto));
 }
 
 void emit_iscsi_node_type(int type)
 {
-    if (isns_trace)
-        printf("33 emit_iscsi_node_type() type = %d\n", type);
+    _isns_tracef("33 emit_iscsi_node_type() type = %d\n", type);
     put_u32_attr(ISNS_TAG_ISCSI_NODE_TYPE, static_cast<unsigned char>(type));
 }
 
 void emit_null_iscsi_node_type(void)
 {
-    if (isns_trace)
-        puts("33 emit_null_iscsi_node_type()");
+    _isns_tracef("33 emit_null_iscsi_node_type()\n");
     put_empty_attr(ISNS_TAG_ISCSI_NODE_TYPE);
 }
 
 void emit_pg_iscsi_name(const char *name)
 {
-    if (isns_trace)
-        printf("48 emit_pg_iscsi_name() name = %s\n", name ? name : "(null)");
+    _isns_tracef("48 emit_pg_iscsi_name() name = %s\n", name ? name : "(null)");
     put_string_attr(ISNS_TAG_PG_ISCSI_NAME, name ? name : "");
 }
 
 void emit_pg_tag(uint32_t tag)
 {
-    if (isns_trace)
-        printf("51 emit_pg_tag() tag = %d\n", static_cast<int>(tag));
+    _isns_tracef("51 emit_pg_tag() tag = %d\n", static_cast<int>(tag));
     put_u32_attr(ISNS_TAG_PG_TAG, tag);
 }
 
@@ -177,22 +181,19 @@ void emit_addr(int is_pg, const unsigned char *addr16)
 void emit_port(int is_pg, uint32_t port)
 {
     const int tag = is_pg ? ISNS_TAG_PG_PORTAL_PORT : ISNS_TAG_PORTAL_PORT;
-    if (isns_trace)
-        printf("%2d emit_port() port = %u\n", tag, port);
+    _isns_tracef("%2d emit_port() port = %u\n", tag, port);
     put_u32_attr(tag, port);
 }
 
 void emit_null_addr(void)
 {
-    if (isns_trace)
-        puts("16 emit_null_addr()");
+    _isns_tracef("16 emit_null_addr()\n");
     put_empty_attr(ISNS_TAG_PORTAL_IP_ADDR);
 }
 
 void emit_null_port(void)
 {
-    if (isns_trace)
-        puts("17 emit_null_port()");
+    _isns_tracef("17 emit_null_port()\n");
     put_empty_attr(ISNS_TAG_PORTAL_PORT);
 }
 

@@ -94,19 +94,16 @@ int open_nonblocking(int family, int *saved, const char *socket_msg)
 {
     socket_fd fd(socket(family, SOCK_STREAM | SOCK_CLOEXEC, 0));
     if (fd.get() < 0) {
-        if (isns_trace)
-            printf(socket_msg, errno, strerror(errno));
+        _isns_tracef(socket_msg, errno, strerror(errno));
         return -1;
     }
     const int flags = fcntl(fd.get(), F_GETFL, 0);
     if (flags < 0) {
-        if (isns_trace)
-            printf("isnsc: get socketfd flag failed (%s)\n", strerror(errno));
+        _isns_tracef("isnsc: get socketfd flag failed (%s)\n", strerror(errno));
         return -1;
     }
     if (fcntl(fd.get(), F_SETFL, flags | O_NONBLOCK) < 0) {
-        if (isns_trace)
-            printf("isnsc: set socketfd flag failed (%s)\n", strerror(errno));
+        _isns_tracef("isnsc: set socketfd flag failed (%s)\n", strerror(errno));
         return -1;
     }
     *saved = flags;
@@ -125,13 +122,11 @@ int connect_non_block(int fd, const struct sockaddr *addr, socklen_t len)
     errno = 0;
     int rc = connect(fd, addr, len);
     if (rc < 0 && errno != EINPROGRESS) {
-        if (isns_trace)
-            printf("isnsc:   connect() failed, errno = %d (%s)\n", errno, strerror(errno));
+        _isns_tracef("isnsc:   connect() failed, errno = %d (%s)\n", errno, strerror(errno));
         return -1;
     }
     if (rc == 0) {
-        if (isns_trace)
-            printf("isnsc: after connect func_ret = %d, errno = %d (%s)\n", rc, errno, strerror(errno));
+        _isns_tracef("isnsc: after connect func_ret = %d, errno = %d (%s)\n", rc, errno, strerror(errno));
         return 0;
     }
     /* poll rather than select: a descriptor number above FD_SETSIZE must not
@@ -141,18 +136,15 @@ int connect_non_block(int fd, const struct sockaddr *addr, socklen_t len)
         rc = poll(&pfd, 1, isns_connect_timeout * 1000);
     while (rc < 0 && errno == EINTR);
     if (rc < 0) {
-        if (isns_trace)
-            printf("isnsc:   select() errno = %d (%s)\n", errno, strerror(errno));
+        _isns_tracef("isnsc:   select() errno = %d (%s)\n", errno, strerror(errno));
         return -1;
     }
     if (rc == 0) {
-        if (isns_trace)
-            printf("isnsc:   select timeout , ret = %d, errno = %d (%s)\n", rc, errno, strerror(errno));
+        _isns_tracef("isnsc:   select timeout , ret = %d, errno = %d (%s)\n", rc, errno, strerror(errno));
         return -1;
     }
     if (!(pfd.revents & (POLLOUT | POLLERR | POLLHUP))) {
-        if (isns_trace)
-            puts("isnsc:   sockfd error - FD_ISSET is false");
+        _isns_tracef("isnsc:   sockfd error - FD_ISSET is false\n");
         return -1;
     }
     int err = 0;
@@ -160,8 +152,7 @@ int connect_non_block(int fd, const struct sockaddr *addr, socklen_t len)
     if (getsockopt(fd, SOL_SOCKET, SO_ERROR, &err, &err_len) < 0)
         err = errno;
     if (err != 0) {
-        if (isns_trace)
-            printf("isnsc: error in connection(), error = %d (%s)\n", err, strerror(err));
+        _isns_tracef("isnsc: error in connection(), error = %d (%s)\n", err, strerror(err));
         return -1;
     }
     return 0;
@@ -177,9 +168,7 @@ int isns_connect(int *fd, int family, const char *address, int port)
     if (sock.get() < 0)
         return -1;
     if (port < 1) {
-        if (isns_trace)
-            printf("isnsc: Warning! Destination port is not given, apply default port %d\n",
-                   ISNS_SERVER_PORT);
+        _isns_tracef("isnsc: Warning! Destination port is not given, apply default port %d\n", ISNS_SERVER_PORT);
         port = ISNS_SERVER_PORT;
     }
 
@@ -203,8 +192,7 @@ int isns_connect(int *fd, int family, const char *address, int port)
             unsigned scopes[3];
             int n = 0;
             if (const unsigned bond = if_nametoindex("bond0")) {
-                if (isns_trace)
-                    printf("scope_id = %d\n", static_cast<int>(bond));
+                _isns_tracef("scope_id = %d\n", static_cast<int>(bond));
                 scopes[n++] = bond;
             }
             scopes[n++] = if_nametoindex("eth0");
@@ -223,8 +211,7 @@ int isns_connect(int *fd, int family, const char *address, int port)
             rc = connect_non_block(sock.get(), reinterpret_cast<sockaddr *>(&sa), sizeof sa);
         }
     } else {
-        if (isns_trace)
-            printf("isnsc: error: inet_type = %d not supported\n", family);
+        _isns_tracef("isnsc: error: inet_type = %d not supported\n", family);
         return -1;
     }
 
@@ -275,10 +262,7 @@ int recv_response(int fd)
 int send_and_recv(void)
 {
     isns_last_status = 0;
-    if (isns_trace) {
-        puts("   send_and_recv()");
-        printf("server ip: %s\n", isns_server_addr);
-    }
+    _isns_tracef("   send_and_recv()\nserver ip: %s\n", isns_server_addr);
     /* The emitter that refused the attribute has logged why. */
     if (isns_pdu_overflowed())
         return -1;
@@ -289,20 +273,17 @@ int send_and_recv(void)
 
     int raw = -1;
     if (isns_connect(&raw, isns_addr_family, isns_server_addr, ISNS_SERVER_PORT) != 0) {
-        if (isns_trace)
-            puts("isnsc:   connect_non_block() error");
+        _isns_tracef("isnsc:   connect_non_block() error\n");
         return -1;
     }
     socket_fd sock(raw);
     /* Never blocks: a request (at most 10000 bytes) fits a fresh socket's
      * send buffer, and a server that stops reading must not hold us. */
     const ssize_t sent = send(sock.get(), isns_pdu_buf, total, MSG_NOSIGNAL | MSG_DONTWAIT);
-    if (isns_trace)
-        printf("sent %d bytes\n", static_cast<int>(sent));
+    _isns_tracef("sent %d bytes\n", static_cast<int>(sent));
 
     const int n = recv_response(sock.get());
-    if (isns_trace)
-        printf("received %d payload bytes\n", n);
+    _isns_tracef("received %d payload bytes\n", n);
     sock.reset();
     return _isns_response_status(n);
 }
@@ -314,7 +295,6 @@ int _isns_response_status(int n)
     isns_last_status = static_cast<int>((static_cast<uint32_t>(isns_pdu_buf[0]) << 24) |
                                         (static_cast<uint32_t>(isns_pdu_buf[1]) << 16) |
                                         (static_cast<uint32_t>(isns_pdu_buf[2]) << 8) | isns_pdu_buf[3]);
-    if (isns_trace)
-        printf("status = %d\n", isns_last_status);
+    _isns_tracef("status = %d\n", isns_last_status);
     return isns_last_status != 0 ? -1 : n;
 }
