@@ -1,13 +1,19 @@
 // SPDX-License-Identifier: Apache-2.0
-// Shared setup of the iSNS client tests: the client's globals in a known state.
+// Shared setup of the iSNS client tests: the client's globals in a known
+// state, nodes, scripted and real servers, recorded PDUs.
 #pragma once
 
 #include <arpa/inet.h>
+#include <chrono>
 #include <cstring>
+#include <fstream>
 #include <memory>
+#include <sstream>
 #include <string>
+#include <vector>
 
-#include "common/korvadm_err.h"
+#include <gtest/gtest.h>
+
 #include "common/korvadm_str.h"
 #include "isns/isns_client.h"
 #include "isns/isns_pdu.h"
@@ -31,24 +37,16 @@ inline void reset_client(const char *server, int family = AF_INET, const char *s
     isns_alias_on = 0;
 }
 
-// 16-byte portal address from IPv4 (mapped) or IPv6 text.
-inline void portal_addr(const char *text, unsigned char out[16])
-{
-    const std::string t = std::strchr(text, ':') ? text : std::string("::ffff:") + text;
-    inet_pton(AF_INET6, t.c_str(), out);
-}
-
-// A node with the given portals (addresses as text, one port for all).
-inline isns_iscsi_node *make_node(const char *name, uint32_t tag, std::initializer_list<const char *> addrs,
-                                  uint32_t port = 3260)
+// A node with the given portals (IPv4 or IPv6 text, port 3260).
+inline isns_iscsi_node *make_node(const char *name, uint32_t tag, const std::vector<std::string> &addrs)
 {
     isns_iscsi_node *n = isns_iscsi_node_new();
     korv::copy_bounded(n->name, name);
     n->pg_tag = tag;
-    for (const char *a : addrs) {
+    for (const std::string &a : addrs) {
         isns_ip_portal *p = isns_ip_portal_new();
-        portal_addr(a, p->address);
-        p->port = port;
+        inet_pton(AF_INET6, (a.find(':') == std::string::npos ? "::ffff:" + a : a).c_str(), p->address);
+        p->port = 3260;
         isns_iscsi_node_add_portal(n, p);
     }
     return n;
@@ -56,8 +54,8 @@ inline isns_iscsi_node *make_node(const char *name, uint32_t tag, std::initializ
 
 inline bytes status_rsp(uint32_t status, uint16_t func = 0x8002)
 {
-    return isns_pdu(func, 0x4c00, {static_cast<uint8_t>(status >> 24), static_cast<uint8_t>(status >> 16),
-                                   static_cast<uint8_t>(status >> 8), static_cast<uint8_t>(status)});
+    const bytes tlv = isns_attr_u32(0, status);  // tag and length, then the status
+    return isns_pdu(func, 0x4c00, bytes(tlv.begin() + 8, tlv.end()));
 }
 
 // A scripted server on address answering every connection with reply, and
@@ -69,6 +67,37 @@ inline std::unique_ptr<isns_fake_server> fake_at(const char *address, isns_fake_
     srv->set_reply(std::move(reply));
     reset_client(address, AF_INET, source);
     return srv;
+}
+
+// Seconds fn() took, with its result.
+template <class Fn>
+std::pair<int, double> timed(Fn fn)
+{
+    const auto t0 = std::chrono::steady_clock::now();
+    const int rc = fn();
+    return {rc, std::chrono::duration<double>(std::chrono::steady_clock::now() - t0).count()};
+}
+
+// The PDUs of a data file: a line "[label] what" starts a record, hex bytes
+// follow ("#" comments to the end of a line).
+struct pdu_record {
+    std::string label, heading;
+    bytes data;
+};
+
+inline std::vector<pdu_record> pdu_records(const std::string &path)
+{
+    std::ifstream in(path);
+    std::vector<pdu_record> out;
+    for (std::string line, word; std::getline(in, line);) {
+        if (line.starts_with('['))
+            out.push_back({line.substr(1, line.find(']') - 1), line, {}});
+        for (std::istringstream words(line.starts_with('[') ? "" : line.substr(0, line.find('#'))); words >> word;)
+            for (size_t i = 0; i + 1 < word.size() && !out.empty(); i += 2)
+                out.back().data.push_back(static_cast<uint8_t>(std::stoi(word.substr(i, 2), nullptr, 16)));
+    }
+    EXPECT_FALSE(out.empty()) << path;
+    return out;
 }
 
 // A fresh isnsd named srv on address (skips when isnsd is not installed),
