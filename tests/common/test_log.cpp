@@ -5,6 +5,7 @@
 #include <unistd.h>
 
 #include <cstdio>
+#include <utility>
 
 #include <gtest/gtest.h>
 
@@ -16,14 +17,12 @@ namespace {
 
 class LogTest : public ::testing::Test {
 protected:
-    void SetUp() override { saved_ = g_korv_debug_level; }
     void TearDown() override { g_korv_debug_level = saved_; }
-    int saved_ = 0;
+    int saved_ = std::exchange(g_korv_debug_level, 0);
 };
 
-TEST_F(LogTest, UnitIsTheFileWithoutDirectoryOrExtensionAndTheMessageIsKeptAsIs)
+TEST_F(LogTest, PrefixIsUnitFunctionLineAndTheMessageIsKeptAsIs)
 {
-    g_korv_debug_level = 0;
     EXPECT_EQ(capture_stdout([] { korv_log(0, "/a/b/korvadm_xmldb_conf.cpp", "f", 7, "x"); }),
               "(korvadm_xmldb_conf:f:7):x\n");
     // A format ending in a newline leaves an empty line.
@@ -44,11 +43,10 @@ TEST_F(LogTest, NothingAtAllAboveTheDebugLevelAndANegativeLevelSilencesErrorsToo
     }
 }
 
-TEST_F(LogTest, PrefixIsUnitFunctionLineAndFlushesEvenWhenNothingPrints)
+TEST_F(LogTest, StatementsFlushEvenWhenNothingPrints)
 {
     // Raw writes to the descriptor (as a child shell's would be) must land
     // after whatever stdio held before the statement.
-    g_korv_debug_level = 0;
     std::string out = capture_stdout([] {
         std::printf("pending");
         DBG(3, "hidden");

@@ -16,7 +16,7 @@
 #include <chrono>
 #include <csignal>
 #include <cstdlib>
-#include <dirent.h>
+#include <filesystem>
 #include <fstream>
 #include <string>
 #include <sys/wait.h>
@@ -35,15 +35,12 @@ std::vector<pid_t> running_daemons()
     while (waitpid(-1, nullptr, WNOHANG) > 0) {
     }
     std::vector<pid_t> pids;
-    DIR *proc = opendir("/proc");
-    for (dirent *e; proc && (e = readdir(proc));) {
-        std::ifstream comm(std::string("/proc/") + e->d_name + "/comm");
+    for (const auto &e : std::filesystem::directory_iterator("/proc")) {
+        std::ifstream comm(e.path() / "comm");
         std::string name;
         if (std::getline(comm, name) && name == "nesrad")
-            pids.push_back(std::atoi(e->d_name));
+            pids.push_back(std::atoi(e.path().filename().c_str()));
     }
-    if (proc)
-        closedir(proc);
     return pids;
 }
 
@@ -52,18 +49,14 @@ bool settled(size_t count)
     return eventually([&] { return running_daemons().size() == count; }, 10s);
 }
 
-std::string stored_ip()
-{
-    char ip[256] = {};
-    xmldb_get_nesrad_ip(ip, sizeof(ip));
-    return ip;
-}
-
-int stored_enable()
+// The stored iSNS enable flag and server.
+std::pair<int, std::string> stored()
 {
     int enable = -1;
+    char ip[256] = {};
     xmldb_get_nesrad_enable(&enable);
-    return enable;
+    xmldb_get_nesrad_ip(ip, sizeof(ip));
+    return {enable, ip};
 }
 
 class NesradControl : public SysRootTest {
@@ -74,7 +67,6 @@ protected:
             GTEST_SKIP() << "stops processes by name: needs its own PID namespace (run as root with unshare)";
         SysRootTest::SetUp();
         db_ = std::make_unique<XmldbService>();
-        path_ = std::getenv("PATH");
     }
     void TearDown() override
     {
@@ -86,7 +78,8 @@ protected:
     }
     // "nesrad" on PATH is the stand-in (or the real daemon's directory).
     void use_daemon_dir(const std::string &dir) { setenv("PATH", (dir + ":" + path_).c_str(), 1); }
-    std::vector<std::string> standin_args() const
+    // The arguments the stand-in was started with, one start a line.
+    static std::vector<std::string> standin_args()
     {
         std::ifstream in(SysRoot::file("/standin.args"));
         std::vector<std::string> lines;
@@ -96,7 +89,7 @@ protected:
     }
 
     std::unique_ptr<XmldbService> db_;
-    std::string path_;
+    std::string path_ = std::getenv("PATH");
 };
 
 TEST_F(NesradControl, SettingStartsRestartsAndStopsOnlyWhenTheServiceRuns)
@@ -107,8 +100,7 @@ TEST_F(NesradControl, SettingStartsRestartsAndStopsOnlyWhenTheServiceRuns)
     // Service disabled: only stored, nothing started.
     xmldb_set_service_enable(0);
     EXPECT_EQ(0, isns_set_setting(1, "first.example", 0));
-    EXPECT_EQ(1, stored_enable());
-    EXPECT_EQ("first.example", stored_ip());
+    EXPECT_EQ(stored(), std::pair(1, std::string("first.example")));
     EXPECT_TRUE(running_daemons().empty());
     EXPECT_EQ(ERR_PARAM, isns_set_setting(2, "first.example", 0));
 
@@ -118,15 +110,14 @@ TEST_F(NesradControl, SettingStartsRestartsAndStopsOnlyWhenTheServiceRuns)
     EXPECT_EQ(0, isns_set_setting(1, hostile.c_str(), 0));
     ASSERT_TRUE(settled(1));
     const pid_t first = running_daemons().front();
-    ASSERT_TRUE(eventually([&] { return standin_args().size() == 1; }, 5s));
+    ASSERT_TRUE(eventually([&] { return standin_args().size() == 1; }, 10s));
     EXPECT_EQ(hostile, standin_args()[0]);
     EXPECT_FALSE(exists(at("/x"))) << "a command in the server text ran";
-    EXPECT_EQ(hostile, stored_ip());
 
     // Same server (stored one used): the running daemon is left alone.
     EXPECT_EQ(0, isns_set_setting(1, "ignored", 1));
     EXPECT_EQ(std::vector<pid_t>{first}, running_daemons());
-    EXPECT_EQ(hostile, stored_ip());
+    EXPECT_EQ(stored(), std::pair(1, hostile));
 
     // Another server: stopped by name, then a new daemon.
     EXPECT_EQ(0, isns_set_setting(1, "second.example", 0));
@@ -140,12 +131,11 @@ TEST_F(NesradControl, SettingStartsRestartsAndStopsOnlyWhenTheServiceRuns)
     // Off with the service disabled: stored only; with it enabled: stopped.
     xmldb_set_service_enable(0);
     EXPECT_EQ(0, isns_set_setting(0, nullptr, 0));
-    EXPECT_EQ(0, stored_enable());
+    EXPECT_EQ(stored(), std::pair(0, std::string("second.example")));
     EXPECT_EQ(1u, running_daemons().size());
     xmldb_set_service_enable(1);
     EXPECT_EQ(0, isns_set_setting(0, nullptr, 0));
     EXPECT_TRUE(settled(0));
-    EXPECT_EQ("second.example", stored_ip());
 }
 
 TEST_F(NesradControl, NotifyReachesTheRealDaemonAndResetClearsTheSettings)
@@ -156,7 +146,10 @@ TEST_F(NesradControl, NotifyReachesTheRealDaemonAndResetClearsTheSettings)
     ASSERT_TRUE(srv.start()) << srv.error();
     set_host_name("nas1");
     store_targets("nas1", {{"disk1"}});
-    auto nodes = [&] { return isnsadm_rows(srv, "nodes", {"iSCSI name"}); };
+    auto holds = [&](const char *disk) {
+        return eventually([&] { return isnsadm_rows(srv, "nodes", {"iSCSI name"}).count(target_iqn("nas1", disk)); },
+                          20s);
+    };
 
     // No daemon: nothing is signalled and the tool does not wait.
     auto t0 = std::chrono::steady_clock::now();
@@ -166,22 +159,19 @@ TEST_F(NesradControl, NotifyReachesTheRealDaemonAndResetClearsTheSettings)
     use_daemon_dir(NESRAD_DIR);
     xmldb_set_service_enable(1);
     ASSERT_EQ(0, isns_set_setting(1, "127.60.0.1", 0));
-    ASSERT_TRUE(eventually([&] { return nodes().count(target_iqn("nas1", "disk1")) == 1; }, 20s));
+    ASSERT_TRUE(holds("disk1"));
     ASSERT_TRUE(settled(1));
     EXPECT_EQ(running_daemons().front(), stored_pid());
-
     store_targets("nas1", {{"disk1"}, {"disk2"}});
     notify_isnsclient(SIGUSR1);
-    EXPECT_TRUE(eventually([&] { return nodes().count(target_iqn("nas1", "disk2")) == 1; }, 20s));
+    EXPECT_TRUE(holds("disk2"));
 
     ASSERT_EQ(0, isns_set_setting(0, nullptr, 1));
     EXPECT_TRUE(settled(0));
     EXPECT_EQ(0, stored_pid());
-    EXPECT_TRUE(eventually([&] { return nodes().empty(); }, 10s));
-
+    EXPECT_TRUE(eventually([&] { return isnsadm_rows(srv, "nodes", {"iSCSI name"}).empty(); }, 10s));
     EXPECT_EQ(0, isns_factory_reset());
-    EXPECT_EQ(0, stored_enable());
-    EXPECT_EQ("", stored_ip());
+    EXPECT_EQ(stored(), std::pair(0, std::string()));
 }
 
 }  // namespace

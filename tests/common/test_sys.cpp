@@ -2,6 +2,8 @@
 // Address entries, the portal address list from the network settings and
 // the link state, the host name and the MAC address.
 #include <cstring>
+#include <fstream>
+#include <sstream>
 #include <string>
 #include <utility>
 #include <vector>
@@ -19,8 +21,7 @@ using korv_test::SysRoot;
 
 TEST(AddressEntries, SearchCompareAndFree)
 {
-    list_t list;
-    list_init(&list);
+    korv::list_owner list(iscsi_ip_free_list);
     iscsi_ip_t *a = iscsi_ip_new(), *b = iscsi_ip_new(), *c = iscsi_ip_new();
     ASSERT_TRUE(a && b && c);
     EXPECT_EQ(a->tag1 + a->tag2 + a->port, -3);  // unknown until set
@@ -28,27 +29,23 @@ TEST(AddressEntries, SearchCompareAndFree)
     std::strcpy(b->ipv6, "2001:db8::2");
     std::strcpy(c->ipv4, "192.0.2.1");
     std::strcpy(c->ipv6, "2001:db8::9");
-    list_append(&a->node, &list);
-    list_append(&b->node, &list);
-
-    EXPECT_EQ(iscsi_ip_search_list_by_IPv4(&list, "192.0.2.1"), a);
-    EXPECT_EQ(iscsi_ip_search_list_by_IPv6(&list, "2001:db8::2"), b);
-    // b has no IPv4: "" must not find it.
-    EXPECT_EQ(iscsi_ip_search_list_by_IPv4(&list, ""), nullptr);
-    EXPECT_EQ(quiet([&] { return iscsi_ip_search_list_by_IPv6(&list, nullptr); }), nullptr);
-
+    list_append(&a->node, list.get());
+    list_append(&b->node, list.get());
+    EXPECT_EQ(iscsi_ip_search_list_by_IPv4(list.get(), "192.0.2.1"), a);
+    EXPECT_EQ(iscsi_ip_search_list_by_IPv6(list.get(), "2001:db8::2"), b);
+    EXPECT_EQ(iscsi_ip_search_list_by_IPv4(list.get(), ""), nullptr);  // b has no IPv4: "" must not find it
+    EXPECT_EQ(quiet([&] { return iscsi_ip_search_list_by_IPv6(list.get(), nullptr); }), nullptr);
     // Equal IPv4 plus differing IPv6: not an equality test.
-    EXPECT_EQ(iscsi_ip_cmp_ip(a, a), 1);
-    EXPECT_EQ(iscsi_ip_cmp_ip(a, b), 1);
-    EXPECT_EQ(iscsi_ip_cmp_ip(a, c), 2);
-    EXPECT_EQ(quiet([&] { return iscsi_ip_cmp_ip(a, nullptr); }), -1);
+    const struct {
+        iscsi_ip_t *x, *y;
+        int want;
+    } cmps[] = {{a, a, 1}, {a, b, 1}, {a, c, 2}, {a, nullptr, -1}};
+    for (const auto &t : cmps)
+        EXPECT_EQ(quiet([&] { return iscsi_ip_cmp_ip(t.x, t.y); }), t.want);
     iscsi_ip_free(c);
-
-    iscsi_ip_free(a);
-    EXPECT_EQ(list.count, 1);
-    EXPECT_EQ(list.head, &b->node);
-    iscsi_ip_free_list(&list);
-    EXPECT_TRUE(list_is_empty(&list));
+    iscsi_ip_free(a);  // unlinks itself
+    EXPECT_EQ(list.get()->count, 1);
+    EXPECT_EQ(list.get()->head, &b->node);
 }
 
 namespace {
@@ -63,39 +60,32 @@ std::ostream &operator<<(std::ostream &os, const Entry &e)
     return os << "{" << e.dev << "," << e.v4 << "," << e.v6 << "}";
 }
 
-using Settings = std::vector<std::pair<std::string, std::string>>;
-
-// Addresses stored in every case; the settings, IPv6 modes and links decide what shows.
-const Settings kStored = {{"lan0/ip", "192.0.2.1"},
-                          {"lan1/ip", "192.0.2.2"},
-                          {"lan0/ipv6/item:1/ipv6address", "2001:db8::1"},
-                          {"lan0/ipv6/dhcp_ipv6address", "2001:db8::d"},
-                          {"lan1/ipv6/local_ipv6address", "fe80::2"}};
-const Settings kBondStatic = {{"bonding/enable", "1"}, {"lan0/ipv6/mode", "static"}, {"lan1/ipv6/mode", "off"}};
-const Settings kBothOff = {{"lan0/ipv6/mode", "off"}, {"lan1/ipv6/mode", "off"}};
-
-const struct NetCase {
-    const char *what;
-    Settings settings;  // under "/network_mgr/", after kStored
+struct NetCase {
+    std::string heading;
     bool up0, up1;
+    std::vector<std::pair<std::string, std::string>> settings;  // under "/network_mgr/"
     std::vector<Entry> want;
-} kNetCases[] = {
-    {"bonded, both links down", kBondStatic, false, false, {}},
-    {"bonded, LAN 2 up: LAN 1's addresses", kBondStatic, false, true, {{"egiga0", "192.0.2.1", "2001:db8::1"}}},
-    {"only LAN 2 up, IPv6 off", kBothOff, false, true, {{"egiga1", "192.0.2.2", ""}}},
-    {"IPv6 off ignores stored addresses", {{"lan0/ipv6/mode", "off"}, {"lan1/ipv6/mode", "off"}, {"lan1/ip", ""}},
-     true, true, {{"egiga0", "192.0.2.1", ""}}},
-    {"dhcp and automatic modes",
-     {{"lan0/ipv6/mode", "dhcp"}, {"lan1/ipv6/mode", "auto"}, {"lan0/ip", ""}, {"lan1/ip", ""}}, true, true,
-     {{"egiga0", "", "2001:db8::d"}, {"egiga1", "", "fe80::2"}}},
-    {"one IPv6 mode unset: no IPv6 at all", {{"lan1/ipv6/mode", "auto"}}, true, false, {{"egiga0", "192.0.2.1", ""}}},
-    {"static mode has no link-local fallback", {{"lan0/ipv6/mode", "off"}, {"lan1/ipv6/mode", "static"}}, false, true,
-     {{"egiga1", "192.0.2.2", ""}}},
-    {"overlong addresses are cut",
-     {{"lan0/ip", std::string(100, '1')}, {"lan0/ipv6/item:1/ipv6address", std::string(100, 'f')},
-      {"lan0/ipv6/mode", "static"}, {"lan1/ipv6/mode", "off"}},
-     true, false, {{"egiga0", std::string(ISCSI_IP_IPV4_LEN - 1, '1'), std::string(ISCSI_IP_IPV6_LEN - 1, 'f')}}},
 };
+
+// The cases of data/net_cases.txt, the [stored] settings first.
+std::vector<NetCase> net_cases()
+{
+    std::ifstream in(KORV_TEST_DATA "/net_cases.txt");
+    std::vector<NetCase> out;
+    for (std::string l; std::getline(in, l);) {
+        if (l.starts_with('['))
+            out.push_back({l, l.starts_with("[up"), l.find(" up]") != std::string::npos, {}, {}});
+        else if (l.starts_with("=> ")) {
+            std::istringstream words(l.substr(3));
+            Entry e;
+            words >> e.dev >> e.v4 >> e.v6;
+            out.back().want.push_back({e.dev, e.v4 == "-" ? "" : e.v4, e.v6 == "-" ? "" : e.v6});
+        } else if (size_t eq = l.find(" ="); eq != std::string::npos && !l.starts_with('#'))
+            out.back().settings.emplace_back(l.substr(0, eq), l.substr(std::min(eq + 3, l.size())));
+    }
+    EXPECT_GT(out.size(), 1u);
+    return out;
+}
 
 void link(int port, bool up)
 {
@@ -110,26 +100,24 @@ TEST(NetList, LinkStateBondingAndIpv6ModesChooseTheEntriesAppendedToTheList)
 {
     korv_test::XmldbService db;
     EXPECT_EQ(quiet([&] { return sys_net_get_ip_list(nullptr); }), ERR_PARAM);
-    for (const NetCase &c : kNetCases) {
+    const std::vector<NetCase> cases = net_cases();
+    for (const NetCase &c : std::vector(cases.begin() + 1, cases.end())) {
         xmldbc_del(XMLDB_SOCK_ISCSI, 0, "/network_mgr");
-        for (const Settings *s : {&kStored, &c.settings})
+        for (const auto *s : {&cases[0].settings, &c.settings})
             for (const auto &[key, value] : *s)
                 ASSERT_EQ(xmldbc_set(XMLDB_SOCK_ISCSI, 0, ("/network_mgr/" + key).c_str(), value.c_str()), 0);
         link(0, c.up0);
         link(1, c.up1);
-        list_t list;
-        list_init(&list);
+        korv::list_owner list(iscsi_ip_free_list);
         iscsi_ip_t *mine = iscsi_ip_new();  // the caller's entries stay first
-        list_append(&mine->node, &list);
-        EXPECT_EQ(quiet([&] { return sys_net_get_ip_list(&list); }), KORV_OK) << c.what;
+        list_append(&mine->node, list.get());
+        EXPECT_EQ(quiet([&] { return sys_net_get_ip_list(list.get()); }), KORV_OK) << c.heading;
+        EXPECT_EQ(list.get()->head, &mine->node) << c.heading;
         std::vector<Entry> got;
-        for (iscsi_ip_t *ip : korv::list_records<iscsi_ip_t>(&list))
-            got.push_back({ip->dev_name, ip->ipv4, ip->ipv6});
-        EXPECT_EQ(list.head, &mine->node) << c.what;
-        if (!got.empty())
-            got.erase(got.begin());
-        iscsi_ip_free_list(&list);
-        EXPECT_EQ(got, c.want) << c.what;
+        for (iscsi_ip_t *ip : korv::list_records<iscsi_ip_t>(list.get()))
+            if (ip != mine)
+                got.push_back({ip->dev_name, ip->ipv4, ip->ipv6});
+        EXPECT_EQ(got, c.want) << c.heading;
     }
 }
 

@@ -113,10 +113,10 @@ TEST_F(Storage, PowermgmtMaskGivesSleepingDisks)
 TEST_F(Storage, ChainAddsUpdatesAndWalks)
 {
     standin("df", "/dev/md1 1000 300 650 35% /\\n");
-    for (auto [idx, mnt] : {std::pair{1, "/"}, {2, "/proc"}}) {
-        put("/vols/vol:" + std::to_string(idx) + "/name", "Volume");
-        put("/vols/vol:" + std::to_string(idx) + "/uuid", "u" + std::to_string(idx));
-        put("/vols/vol:" + std::to_string(idx) + "/mnt", mnt);
+    for (auto [idx, mnt] : {std::pair{"1", "/"}, {"2", "/proc"}}) {
+        put("/vols/vol:" + std::string(idx) + "/name", "Volume");
+        put("/vols/vol:" + std::string(idx) + "/uuid", "u" + std::string(idx));
+        put("/vols/vol:" + std::string(idx) + "/mnt", mnt);
     }
     vol_lun_info_t *head = nullptr;
     vol_lun_info_t *a = quiet([&] { return vol_lun_info_update(&head, "u1", 1, 2, 3, 0); });
@@ -131,14 +131,13 @@ TEST_F(Storage, ChainAddsUpdatesAndWalks)
     EXPECT_EQ(vol_lun_info_update(&head, "u1", 10, 110, 0, -1), a);
     EXPECT_EQ(std::pair(a->free_size, a->hibernation), std::pair(uint64_t{582}, 0));
     vol_lun_info_update(&head, "u1", 0, 5000, 0, 1);
-    EXPECT_EQ(std::pair(a->free_size, a->hibernation), std::pair(uint64_t{0}, 1));
-    EXPECT_EQ(U64s({a->lun_alloc_size, a->lun_claim_size, a->lun_extra_size}), U64s({11, 5112, 3}));
+    EXPECT_EQ(U64s({a->free_size, a->lun_alloc_size, a->lun_claim_size, a->lun_extra_size}), U64s({0, 11, 5112, 3}));
+    EXPECT_EQ(a->hibernation, 1);
 
-    EXPECT_EQ(vol_lun_info_list_get_nth(head, 0), a);
-    EXPECT_EQ(vol_lun_info_list_get_nth(head, -1), b);
-    EXPECT_EQ(vol_lun_info_list_get_nth(head, -1), nullptr);
-    EXPECT_EQ(vol_lun_info_list_get_nth(head, 1), b);
-    b->next = b;  // a record pointing at itself ends every walk
+    // The walk remembers its place; a record pointing at itself ends it.
+    for (auto [n, want] : {std::pair{0, a}, {-1, b}, {-1, nullptr}, {1, b}})
+        EXPECT_EQ(vol_lun_info_list_get_nth(head, n), want) << n;
+    b->next = b;
     EXPECT_EQ(vol_lun_info_list_get_nth(head, 5), nullptr);
     quiet([&] { vol_lun_info_list_deinit(&head); return 0; });
     EXPECT_EQ(head, nullptr);
