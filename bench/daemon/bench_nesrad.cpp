@@ -17,7 +17,15 @@
 // level, the 64 targets, two pid writes). A last daemon run checks that
 // isnsd really holds the 64 targets before the SIGTERM.
 //
+// --memory: the daemon's memory in its steady check loop against a bare C
+// program making the same exchanges (nesrad_bare_isns: the same 64
+// registrations, then the check query every minute), each with an isnsd of
+// its own, run side by side: VmHWM from /proc/PID/status, Rss, Pss and
+// Private from /proc/PID/smaps_rollup, read once the server holds all 64
+// targets and each program has made its first check (about a minute).
+//
 //   bench_nesrad [runs]     (default 20; needs isnsd and isnsadm)
+//   bench_nesrad --memory
 #include <arpa/inet.h>
 #include <fcntl.h>
 #include <signal.h>
@@ -48,6 +56,7 @@ namespace {
 using clock_type = std::chrono::steady_clock;
 
 constexpr const char *kServer = "127.30.0.1";
+constexpr const char *kBareServer = "127.30.0.2";  // the bare program's own isnsd (--memory)
 constexpr const char *kPrefix = "iqn.2026-01.org.example:";
 constexpr const char *kEid = "bench-nas";
 constexpr int kTargets = 64;
@@ -137,6 +146,42 @@ long status_kib(pid_t pid, const char *field)
     return -1;
 }
 
+// How many nodes the isnsd behind adm_conf holds.
+int held_nodes(const std::string &adm_conf)
+{
+    std::string cmd = "timeout 5 isnsadm -c " + adm_conf + " --local --list nodes | grep -c 'iSCSI name'";
+    int held = 0;
+    if (FILE *p = popen(cmd.c_str(), "r")) {
+        if (std::fscanf(p, "%d", &held) != 1)
+            held = 0;
+        pclose(p);
+    }
+    return held;
+}
+
+// An in-memory isnsd on addr, its files in <root>/<dir>; *adm_conf names
+// the isnsadm configuration that reaches it.
+child start_isnsd(const char *addr, const std::string &dir, std::string *adm_conf)
+{
+    std::string isns = g_root + "/" + dir;
+    mkdirs(isns);
+    std::ofstream(isns + "/isnsd.conf")
+        << "SourceName = " << kPrefix << dir << "\nBindAddress = " << addr << "\nPIDFile = " << isns
+        << "/isnsd.pid\nControlSocket = " << isns << "/isnsctl\nLocalRegistry = " << isns
+        << "/isns.registry\nSecurity = 0\nSLPRegister = 0\n"
+        << "DefaultDiscoveryDomain = 1\nRegistrationPeriod = 0\nESIRetries = 0\n";
+    *adm_conf = isns + "/isnsadm.conf";
+    std::ofstream(*adm_conf) << "SourceName = " << kPrefix << "isnsadm-bench\nControlSocket = " << isns
+                             << "/isnsctl\nSecurity = 0\n";
+    child c = spawn({"/usr/sbin/isnsd", "-f", "-c", isns + "/isnsd.conf"});
+    for (int i = 0; i < 100; ++i) {
+        if (std::system(("isnsadm -c " + *adm_conf + " --local --list entities >/dev/null 2>&1").c_str()) == 0)
+            return c;
+        std::this_thread::sleep_for(std::chrono::milliseconds(100));
+    }
+    die("isnsd on " + std::string(addr) + " did not start");
+}
+
 // nesrad until it has registered and waits, then SIGTERM; with verify,
 // isnsd's view (through *held and *hwm_kib) is read before the signal.
 outcome run_daemon(const std::string &adm_conf, bool verify, int *held, long *hwm_kib)
@@ -148,15 +193,9 @@ outcome run_daemon(const std::string &adm_conf, bool verify, int *held, long *hw
         std::this_thread::sleep_for(std::chrono::microseconds(100));
     }
     if (verify) {
-        std::string cmd = "timeout 5 isnsadm -c " + adm_conf + " --local --list nodes | grep -c 'iSCSI name'";
         for (int i = 0; i < 200 && *held < kTargets; ++i) {
             std::this_thread::sleep_for(std::chrono::milliseconds(50));
-            FILE *p = popen(cmd.c_str(), "r");
-            if (p) {
-                if (std::fscanf(p, "%d", held) != 1)
-                    *held = 0;
-                pclose(p);
-            }
+            *held = held_nodes(adm_conf);
         }
         *hwm_kib = status_kib(c.pid, "VmHWM:");
     }
@@ -194,6 +233,97 @@ int floor_mode()
     return deregister_entity(isns_entity_name) == 0 ? 0 : 1;
 }
 
+// Memory of a process, KiB: VmHWM from status; Rss, Pss, Private from smaps_rollup.
+struct memory {
+    long hwm = -1, rss = 0, pss = 0, priv = 0;
+};
+
+memory memory_of(pid_t pid)
+{
+    memory m;
+    m.hwm = status_kib(pid, "VmHWM:");
+    std::ifstream in("/proc/" + std::to_string(pid) + "/smaps_rollup");
+    std::string key;
+    long kib = 0;
+    while (in >> key >> kib) {
+        if (key == "Rss:")
+            m.rss = kib;
+        else if (key == "Pss:")
+            m.pss = kib;
+        else if (key == "Private_Clean:" || key == "Private_Dirty:")
+            m.priv += kib;
+        in.ignore(1 << 20, '\n');
+    }
+    return m;
+}
+
+// Follows one program to its steady check loop: all targets held by its
+// server, then its first check made (it left its wait, and waits again).
+struct follow {
+    const char *name;
+    child c;
+    std::string adm_conf;
+    clock_type::time_point registered{};
+    long switches = -1;
+    bool steady = false;
+
+    void step()
+    {
+        if (steady)
+            return;
+        if (waitpid(c.pid, nullptr, WNOHANG) == c.pid)
+            die(std::string(name) + " ended before its first check");
+        if (switches < 0) {
+            if (waiting_for_check(c.pid) && held_nodes(adm_conf) == kTargets) {
+                registered = clock_type::now();
+                switches = status_kib(c.pid, "voluntary_ctxt_switches:");
+            }
+            return;
+        }
+        // The check comes a minute after the registration; waking up in
+        // between (a signal) is not one.
+        steady = clock_type::now() - registered > std::chrono::seconds(50) && waiting_for_check(c.pid) &&
+                 status_kib(c.pid, "voluntary_ctxt_switches:") != switches;
+    }
+};
+
+int memory_mode(const std::string &adm_conf, const std::string &bare_adm)
+{
+    follow runs[] = {
+        {"nesrad", spawn({NESRAD_BIN, kServer}), adm_conf},
+        {"nesrad_bare_isns", spawn({NESRAD_BARE_ISNS_BIN, kBareServer, kEid, kPrefix, std::to_string(kTargets), "60",
+                                    "3260", "192.0.2.10", "2001:db8::10"}),
+         bare_adm},
+    };
+    auto deadline = clock_type::now() + std::chrono::seconds(180);
+    while (!(runs[0].steady && runs[1].steady)) {
+        if (clock_type::now() > deadline)
+            die("no steady check loop within 180 s");
+        for (follow &f : runs)
+            f.step();
+        std::this_thread::sleep_for(std::chrono::milliseconds(200));
+    }
+    const memory d = memory_of(runs[0].c.pid), b = memory_of(runs[1].c.pid);
+    kill(runs[1].c.pid, SIGTERM);
+    reap(runs[1].c);
+    kill(runs[0].c.pid, SIGTERM);
+    const int status = reap(runs[0].c).status;
+
+    std::printf("%d targets, 2 portals each, registered with an in-memory isnsd each; after the first check\n",
+                kTargets);
+    std::printf("%-36s %9s %9s %9s %9s\n", "KiB", "VmHWM", "Rss", "Pss", "Private");
+    for (auto [name, m] : {std::pair{"nesrad", d}, std::pair{"bare C program, same exchanges", b}})
+        std::printf("%-36s %9ld %9ld %9ld %9ld\n", name, m.hwm, m.rss, m.pss, m.priv);
+    const double pss = static_cast<double>(d.pss) / static_cast<double>(b.pss);
+    const double priv = static_cast<double>(d.priv) / static_cast<double>(b.priv);
+    std::printf("nesrad / bare: VmHWM %.2f, Pss %.2f, Private %.2f\n",
+                static_cast<double>(d.hwm) / static_cast<double>(b.hwm), pss, priv);
+    std::printf("goal: Pss and Private each <= 1.5 x the bare program's: %s\n",
+                pss <= 1.5 && priv <= 1.5 ? "met" : "NOT met");
+    std::printf("nesrad exit status after SIGTERM: %d\n", status);
+    return status == 0 ? 0 : 1;
+}
+
 double median(std::vector<double> v)
 {
     std::sort(v.begin(), v.end());
@@ -211,7 +341,8 @@ int main(int argc, char **argv)
 {
     if (argc > 1 && std::strcmp(argv[1], "--floor") == 0)
         return floor_mode();
-    int runs = argc > 1 ? std::atoi(argv[1]) : 20;
+    const bool memory_run = argc > 1 && std::strcmp(argv[1], "--memory") == 0;
+    int runs = argc > 1 && !memory_run ? std::atoi(argv[1]) : 20;
     if (runs < 1)
         die("usage: bench_nesrad [runs]");
 
@@ -254,19 +385,21 @@ int main(int argc, char **argv)
     }
     dbSetLL(kTargets, "/iscsi/target/count");
 
-    // The in-memory iSNS server.
-    std::string isns = g_root + "/isns";
-    mkdirs(isns);
-    std::ofstream(isns + "/isnsd.conf")
-        << "SourceName = " << kPrefix << "isns-bench\nBindAddress = " << kServer
-        << "\nPIDFile = " << isns << "/isnsd.pid\nControlSocket = " << isns
-        << "/isnsctl\nLocalRegistry = " << isns << "/isns.registry\nSecurity = 0\nSLPRegister = 0\n"
-        << "DefaultDiscoveryDomain = 1\nRegistrationPeriod = 0\nESIRetries = 0\n";
-    std::string adm_conf = isns + "/isnsadm.conf";
-    std::ofstream(adm_conf) << "SourceName = " << kPrefix << "isnsadm-bench\nControlSocket = " << isns
-                            << "/isnsctl\nSecurity = 0\n";
-    child isnsd = spawn({"/usr/sbin/isnsd", "-f", "-c", isns + "/isnsd.conf"});
-    std::this_thread::sleep_for(std::chrono::milliseconds(300));
+    std::string adm_conf;
+    child isnsd = start_isnsd(kServer, "isns", &adm_conf);
+    if (memory_run) {
+        std::string bare_adm;
+        child bare_isnsd = start_isnsd(kBareServer, "isns-bare", &bare_adm);
+        int rc = memory_mode(adm_conf, bare_adm);
+        for (const child &c : {isnsd, bare_isnsd}) {
+            kill(c.pid, SIGTERM);
+            reap(c);
+        }
+        kill(xmldbd, SIGTERM);
+        waitpid(xmldbd, nullptr, 0);
+        std::system(("rm -rf '" + g_root + "'").c_str());
+        return rc;
+    }
 
     // The configuration read of the daemon, in-process.
     std::vector<double> conf_ms;
