@@ -233,9 +233,10 @@ int floor_mode()
     return deregister_entity(isns_entity_name) == 0 ? 0 : 1;
 }
 
-// Memory of a process, KiB: VmHWM from status; Rss, Pss, Private from smaps_rollup.
+// Memory of a process, KiB: VmHWM from status; Rss, Pss, Private and its
+// dirty part (what the kernel cannot drop and read again) from smaps_rollup.
 struct memory {
-    long hwm = -1, rss = 0, pss = 0, priv = 0;
+    long hwm = -1, rss = 0, pss = 0, priv = 0, dirty = 0;
 };
 
 memory memory_of(pid_t pid)
@@ -243,17 +244,24 @@ memory memory_of(pid_t pid)
     memory m;
     m.hwm = status_kib(pid, "VmHWM:");
     std::ifstream in("/proc/" + std::to_string(pid) + "/smaps_rollup");
-    std::string key;
-    long kib = 0;
-    while (in >> key >> kib) {
-        if (key == "Rss:")
+    for (std::string line; std::getline(in, line);) {
+        char key[32];
+        long kib = 0;
+        if (std::sscanf(line.c_str(), "%31s %ld kB", key, &kib) != 2)
+            continue;  // the address range heading the rollup
+        if (std::strcmp(key, "Rss:") == 0)
             m.rss = kib;
-        else if (key == "Pss:")
+        else if (std::strcmp(key, "Pss:") == 0)
             m.pss = kib;
-        else if (key == "Private_Clean:" || key == "Private_Dirty:")
+        else if (std::strcmp(key, "Private_Clean:") == 0)
             m.priv += kib;
-        in.ignore(1 << 20, '\n');
+        else if (std::strcmp(key, "Private_Dirty:") == 0) {
+            m.priv += kib;
+            m.dirty = kib;
+        }
     }
+    if (m.hwm <= 0 || m.pss <= 0 || m.priv <= 0)
+        die("cannot read the memory of pid " + std::to_string(pid));
     return m;
 }
 
@@ -311,13 +319,14 @@ int memory_mode(const std::string &adm_conf, const std::string &bare_adm)
 
     std::printf("%d targets, 2 portals each, registered with an in-memory isnsd each; after the first check\n",
                 kTargets);
-    std::printf("%-36s %9s %9s %9s %9s\n", "KiB", "VmHWM", "Rss", "Pss", "Private");
+    std::printf("%-34s %7s %7s %7s %8s %14s\n", "KiB", "VmHWM", "Rss", "Pss", "Private", "Private_Dirty");
     for (auto [name, m] : {std::pair{"nesrad", d}, std::pair{"bare C program, same exchanges", b}})
-        std::printf("%-36s %9ld %9ld %9ld %9ld\n", name, m.hwm, m.rss, m.pss, m.priv);
+        std::printf("%-34s %7ld %7ld %7ld %8ld %14ld\n", name, m.hwm, m.rss, m.pss, m.priv, m.dirty);
     const double pss = static_cast<double>(d.pss) / static_cast<double>(b.pss);
     const double priv = static_cast<double>(d.priv) / static_cast<double>(b.priv);
-    std::printf("nesrad / bare: VmHWM %.2f, Pss %.2f, Private %.2f\n",
-                static_cast<double>(d.hwm) / static_cast<double>(b.hwm), pss, priv);
+    std::printf("nesrad / bare: VmHWM %.2f, Pss %.2f, Private %.2f, Private_Dirty %.2f\n",
+                static_cast<double>(d.hwm) / static_cast<double>(b.hwm), pss, priv,
+                static_cast<double>(d.dirty) / static_cast<double>(b.dirty));
     std::printf("goal: Pss and Private each <= 1.5 x the bare program's: %s\n",
                 pss <= 1.5 && priv <= 1.5 ? "met" : "NOT met");
     std::printf("nesrad exit status after SIGTERM: %d\n", status);
