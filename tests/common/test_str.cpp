@@ -15,7 +15,7 @@
 
 namespace {
 
-TEST(CopyBounded, CutsTerminatesAndSaysWhetherAllFitted)
+TEST(CopyBounded, CutsTerminatesSaysWhetherAllFittedAndNeverReadsPastAField)
 {
     struct {
         const char *src;
@@ -31,10 +31,8 @@ TEST(CopyBounded, CutsTerminatesAndSaysWhetherAllFitted)
     char none[1] = {'x'};
     EXPECT_FALSE(korv::copy_bounded(none, 0, "a"));
     EXPECT_EQ(none[0], 'x');
-}
 
-TEST(CopyBounded, NeverReadsPastAFieldThatLacksItsTerminator)
-{
+    // A field without its terminator, followed by other bytes.
     struct {
         char field[4];
         char guard[4];
