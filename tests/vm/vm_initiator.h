@@ -11,13 +11,12 @@
 
 namespace vm {
 
-// A session as `initiator` with `iqn` at `portal`, with CHAP as "vmuser"
-// when a secret is given and the ISID when one is given; logged out when it
-// goes. Commands answer their SCSI status (-1 when none came back).
+// A session as `initiator` with `iqn` at 127.0.0.1:3260, with CHAP as
+// "vmuser" when a secret is given; logged out when it goes. Commands answer
+// their SCSI status (-1 when none came back).
 class Session {
 public:
-    Session(const std::string &initiator, const std::string &iqn, const char *secret = nullptr,
-            const char *portal = "127.0.0.1:3260", const uint8_t *isid = nullptr)
+    Session(const std::string &initiator, const std::string &iqn, const char *secret = nullptr)
         : ctx_(iscsi_create_context(initiator.c_str()))
     {
         iscsi_set_targetname(ctx_, iqn.c_str());
@@ -26,9 +25,7 @@ public:
         iscsi_set_timeout(ctx_, 10);
         if (secret)
             iscsi_set_initiator_username_pwd(ctx_, "vmuser", secret);
-        if (isid)  // of type 0x80 (random): the five bytes after it are ours
-            iscsi_set_isid_random(ctx_, isid[1] << 16 | isid[2] << 8 | isid[3], isid[4] << 8 | isid[5]);
-        up = iscsi_connect_sync(ctx_, portal) == 0 && iscsi_login_sync(ctx_) == 0;
+        up = iscsi_connect_sync(ctx_, "127.0.0.1:3260") == 0 && iscsi_login_sync(ctx_) == 0;
     }
     ~Session()
     {

@@ -5,7 +5,6 @@
 // test. Header-only.
 #pragma once
 
-#include <arpa/inet.h>
 #include <gtest/gtest.h>
 #include <sys/stat.h>
 
@@ -19,6 +18,7 @@
 #include <vector>
 
 #include "kernel/korvadm_mod.h"
+#include "tests/support/process.h"
 
 namespace vm {
 
@@ -152,34 +152,20 @@ inline std::vector<std::string> subdirs(const std::string &dir)
 // The target modules now loaded, in load order.
 inline std::vector<std::string> loaded_target_modules()
 {
-    std::ifstream in("/proc/modules");
-    std::string all, line;
-    while (std::getline(in, line))
-        all += " " + line.substr(0, line.find(' ')) + " ";
+    const std::string all = "\n" + korv_test::run_shell("cut -d' ' -f1 /proc/modules");
     std::vector<std::string> loaded;
     for (const char *m : kModules)
-        if (all.find(" " + std::string(m) + " ") != std::string::npos)
+        if (all.find("\n" + std::string(m) + "\n") != std::string::npos)
             loaded.push_back(m);
     return loaded;
 }
 
-// The automatic fe80:: address of an interface, from /proc/net/if_inet6;
-// "" when it has none.
+// The automatic fe80:: address of an interface; "" when it has none.
 inline std::string link_local_of(const std::string &ifname)
 {
-    std::ifstream in("/proc/net/if_inet6");
-    std::string hex, index, plen, scope, flags, name;
-    while (in >> hex >> index >> plen >> scope >> flags >> name) {
-        if (name != ifname || hex.compare(0, 4, "fe80") != 0 || hex.size() != 32)
-            continue;
-        unsigned char bytes[16];
-        for (int i = 0; i < 16; i++)
-            bytes[i] = static_cast<unsigned char>(std::stoi(hex.substr(2 * i, 2), nullptr, 16));
-        char text[INET6_ADDRSTRLEN];
-        if (inet_ntop(AF_INET6, bytes, text, sizeof text))
-            return text;
-    }
-    return "";
+    const std::string out = korv_test::run_shell("ip -6 addr show dev " + ifname +
+                                                 " scope link | sed -n 's|.*inet6 \\(fe80[^/]*\\)/.*|\\1|p'");
+    return out.substr(0, out.find('\n'));
 }
 
 // The driver's stop leaves no target module and configfs mounted, whatever
