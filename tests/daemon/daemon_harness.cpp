@@ -7,7 +7,6 @@
 #include <cstdlib>
 #include <fstream>
 #include <iterator>
-#include <map>
 #include <sstream>
 
 #include <gtest/gtest.h>
@@ -64,45 +63,32 @@ long long stored_pid()
 std::string nesrad_binary() { return NESRAD_BIN; }
 std::string nesrad_test_binary() { return NESRAD_TEST_BIN; }
 
-std::set<std::string> isnsadm_rows(const isnsd_server &srv, const std::string &what,
-                                   std::initializer_list<const char *> keys)
+std::set<std::string> isnsadm_rows(const isnsd_server &srv, const std::string &what, const std::string &key)
 {
-    // isnsadm prints "Object N:", then one "<tag and type>: <name> = <value>" line per attribute.
-    std::vector<std::map<std::string, std::string>> objects;
+    // isnsadm prints one "<tag and type>: <name> = <value>" line per attribute.
+    std::set<std::string> values;
     std::istringstream in(srv.adm("--list " + what));
     for (std::string line; std::getline(in, line);) {
         const size_t colon = line.find(": "), eq = line.find(" = ", colon);
-        if (line.rfind("Object ", 0) == 0)
-            objects.emplace_back();
-        else if (!objects.empty() && eq != std::string::npos && colon != std::string::npos) {
-            std::string value = line.substr(eq + 3);
-            if (value.size() >= 2 && value.front() == '"' && value.back() == '"')
-                value = value.substr(1, value.size() - 2);
-            objects.back()[line.substr(colon + 2, eq - colon - 2)] = value;
-        }
+        if (eq == std::string::npos || line.compare(colon + 2, eq - colon - 2, key) != 0)
+            continue;
+        std::string value = line.substr(eq + 3);
+        if (value.size() >= 2 && value.front() == '"' && value.back() == '"')
+            value = value.substr(1, value.size() - 2);
+        values.insert(value);
     }
-    std::set<std::string> rows;
-    for (auto &o : objects) {
-        std::string row;
-        for (const char *k : keys)
-            row += (row.empty() ? "" : " ") + o[k];
-        rows.insert(row);
-    }
-    return rows;
+    return values;
 }
 
-daemon_process::daemon_process(const std::string &binary, const std::string &server,
-                               std::vector<std::string> wrapper)
+daemon_process::daemon_process(const std::string &binary, const std::string &server)
 {
     char tmpl[] = "/tmp/nesrad-log-XXXXXX";
     const int fd = mkstemp(tmpl);
     EXPECT_GE(fd, 0) << "mkstemp";
     close(fd);
     log_ = tmpl;
-    wrapper.push_back(binary);
-    wrapper.push_back(server);
     // Nothing of ours (the database client's connection) goes to the daemon.
-    proc_.start(wrapper, log_, [] { close_range(3, ~0U, 0); });
+    proc_.start({binary, server}, log_, [] { close_range(3, ~0U, 0); });
 }
 
 daemon_process::~daemon_process()

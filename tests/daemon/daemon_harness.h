@@ -8,7 +8,6 @@
 
 #include <sys/types.h>
 
-#include <initializer_list>
 #include <set>
 #include <string>
 #include <vector>
@@ -54,17 +53,13 @@ std::string nesrad_test_binary();
 // Interval of the test-only daemon, seconds.
 inline constexpr int kTestInterval = 2;
 
-// One row per object of `isnsadm --list <what>`: the values of `keys`,
-// joined by single spaces (quotes stripped).
-std::set<std::string> isnsadm_rows(const isnsd_server &srv, const std::string &what,
-                                   std::initializer_list<const char *> keys);
+// The values of attribute `key` in `isnsadm --list <what>` (quotes stripped).
+std::set<std::string> isnsadm_rows(const isnsd_server &srv, const std::string &what, const std::string &key);
 
 class daemon_process {
 public:
-    // Runs `binary server` (extra words before the argument, e.g. valgrind,
-    // go in `wrapper`) with stdout and stderr in a file; env as ours.
-    daemon_process(const std::string &binary, const std::string &server,
-                   std::vector<std::string> wrapper = {});
+    // Runs `binary server` with stdout and stderr in a file; env as ours.
+    daemon_process(const std::string &binary, const std::string &server);
     ~daemon_process();  // SIGKILLs a daemon still running
     daemon_process(const daemon_process &) = delete;
     daemon_process &operator=(const daemon_process &) = delete;

@@ -40,11 +40,8 @@ std::set<std::string> iqns(const std::string &eid, std::initializer_list<const c
 
 const std::set<std::string> kThree = iqns(kEid, {"t1", "t2", "t3"});
 
-std::set<std::string> node_names(const isnsd_server &srv) { return isnsadm_rows(srv, "nodes", {"iSCSI name"}); }
-std::set<std::string> entity_ids(const isnsd_server &srv)
-{
-    return isnsadm_rows(srv, "entities", {"Entity identifier"});
-}
+std::set<std::string> node_names(const isnsd_server &srv) { return isnsadm_rows(srv, "nodes", "iSCSI name"); }
+std::set<std::string> entity_ids(const isnsd_server &srv) { return isnsadm_rows(srv, "entities", "Entity identifier"); }
 
 uint16_t func_of(const bytes &pdu) { return pdu.size() >= 4 ? static_cast<uint16_t>(pdu[2] << 8 | pdu[3]) : 0; }
 
@@ -163,30 +160,31 @@ TEST_F(Appliance, RegistersEveryTargetAndFollowsSignals)
     EXPECT_EQ(std::set<std::string>{kEid}, entity_ids(*srv_));
     EXPECT_EQ(d.pid(), stored_pid());
 
-    // Both portals with each target's own tag; none for t2 and t3. The groups
-    // the server makes itself (tag 1) for nodes other than t1 are not ours.
-    std::set<std::string> ours, want;
-    for (const std::string &pg : isnsadm_rows(*srv_, "portal-groups", {"Portal group name", "Portal group address",
-                                                                     "Portal group port", "Portal group tag"}))
-        if (pg.back() != '1' || pg.rfind(target_iqn(kEid, "t1"), 0) == 0)
-            ours.insert(pg);
-    for (const char *t : {"t1", "t4"})
-        for (const char *addr : {" 192.0.2.10", " 2001:db8::10"})
-            want.insert(target_iqn(kEid, t) + addr + " 3260/tcp " + (t[1] == '1' ? "1" : "4"));
-    EXPECT_EQ(want, ours);
-
-    targets.push_back({"t5", 5});
-    store_targets(kEid, targets);
-    d.signal(SIGUSR1);
-    EXPECT_TRUE(holds(iqns(kEid, {"t1", "t2", "t4", "t5"}), 5s)) << d.output();
-
+    // Portal groups with each target's own tag: vm_appliance_e2e; SIGUSR1
+    // re-registration: the reload cases below.
     set_host_name("NAS_Box2");
     store_targets("nas-box2", kThreeTargets);
     d.signal(SIGUSR2);
     EXPECT_TRUE(holds(iqns("nas-box2", {"t1", "t2", "t3"}), 5s)) << srv_->adm("--list nodes") << d.output();
     EXPECT_EQ(std::set<std::string>{"nas-box2"}, entity_ids(*srv_)) << "the old entity was deregistered";
-    EXPECT_EQ(1, d.count("Received event SIGUSR1(10)"));
     EXPECT_EQ(1, d.count("Received event SIGUSR2(12)"));
+
+    // Twenty more reloads keep the descriptors (leaks: the sanitizer build's
+    // leak check fails the exit status), counted once a pass is surely over.
+    const std::string last = "register iqn=" + target_iqn("nas-box2", "t3");
+    auto idle_fds = [&] {
+        std::this_thread::sleep_for(500ms);
+        auto fds = std::filesystem::directory_iterator("/proc/" + std::to_string(d.pid()) + "/fd");
+        return std::distance(begin(fds), end(fds));
+    };
+    const auto fds = idle_fds();
+    ASSERT_GT(fds, 0);
+    for (int i = 2; i <= 21; ++i) {
+        d.signal(i % 2 ? SIGUSR1 : SIGUSR2);
+        ASSERT_TRUE(d.wait_for(last, 5s, i)) << d.output();
+    }
+    EXPECT_EQ(fds, idle_fds());
+    EXPECT_TRUE(holds(iqns("nas-box2", {"t1", "t2", "t3"}), 5s)) << d.output();
 
     // A second daemon waits for the first, and gives up after 20 s.
     const auto started = clock_type::now();
@@ -355,14 +353,7 @@ TEST_F(Appliance, OutagesOfTheServerOrTheConfigurationServiceAreSurvived)
     EXPECT_TRUE(holds(kThree, 2 * kInterval + 5s)) << d.output();
     EXPECT_EQ(1, d.count("server is back, reinit"));
 
-    // In-memory database: empty after the restart, filled again at the next
-    // check (which may also catch the server down and reload once it is back).
-    ASSERT_TRUE(srv_->restart()) << srv_->error();
-    EXPECT_TRUE(node_names(*srv_).empty());
-    EXPECT_TRUE(holds(kThree, 2 * kInterval + 5s)) << d.output();
-    EXPECT_EQ(2, d.count("reinit")) << d.output();
-    EXPECT_EQ(std::set<std::string>{kEid}, entity_ids(*srv_));
-
+    // A server that lost our data is caught by the check: EverythingHangsOnTheFirstTarget.
     // The configuration service down for 3 s during a reload.
     db_.stop();
     d.signal(SIGUSR1);
@@ -411,33 +402,4 @@ TEST_F(Appliance, ShortRegistrationPeriodNeverLetsTheTargetsExpire)
         missing += node_names(*srv_) != kThree;
     EXPECT_EQ(0, missing) << "seconds without the targets" << d.output();
     EXPECT_EQ(0, d.count("reinit")) << d.output();
-}
-
-// ---- resources ----
-
-// Leaks are caught by the sanitizer build, whose leak check at exit fails
-// the daemon's exit status.
-TEST_F(Appliance, ManyReloadsLeakNothingAndKeepTheDescriptors)
-{
-    start_isnsd("127.20.5.1");
-    store_targets(kEid, kThreeTargets);
-    daemon_process d(nesrad_test_binary(), "127.20.5.1");
-    const std::string last = "register iqn=" + target_iqn(kEid, "t3");
-    // Descriptors are counted once the pass's last exchange is surely over.
-    auto idle_fds = [&] {
-        std::this_thread::sleep_for(500ms);
-        auto fds = std::filesystem::directory_iterator("/proc/" + std::to_string(d.pid()) + "/fd");
-        return std::distance(begin(fds), end(fds));
-    };
-    ASSERT_TRUE(d.wait_for(last, 5s)) << d.output();
-    const auto fds = idle_fds();
-    ASSERT_GT(fds, 0);
-    for (int i = 2; i <= 21; ++i) {
-        d.signal(i % 2 ? SIGUSR1 : SIGUSR2);
-        ASSERT_TRUE(d.wait_for(last, 5s, i)) << d.output();
-    }
-    EXPECT_EQ(fds, idle_fds());
-    EXPECT_EQ(kThree, node_names(*srv_));
-    d.signal(SIGTERM);
-    EXPECT_EQ(0, d.wait_exit(5s)) << d.output();
 }

