@@ -80,15 +80,14 @@ TEST(PlatformSystem, ReturnsTheShellStatusAndEscapedValuesStayData)
     EXPECT_EQ(System(nullptr), -1);
     EXPECT_EQ(str_insert_back_slash(nullptr), nullptr);
 
+    // What the shell reads inside double quotes, a trailing backslash
+    // included, through the real shell. Each escape: ShellEscape (test_str).
     const std::string canary = SysRoot::file("/canary"), out = SysRoot::file("/echo-out");
-    for (const std::string &v : std::vector<std::string>{"plain", "$(touch " + canary + ")", "`touch " + canary + "`",
-                                 "a\"; touch " + canary + "; echo \"", "back\\slash\\", "$HOME ${PATH} $$",
-                                 "tab\tnew\nline 'single'", ""}) {
-        const korv::c_buffer esc(str_insert_back_slash(v.c_str()));
-        ASSERT_NE(esc, nullptr);
-        EXPECT_EQ(System("printf '%%s' \"%s\" > %s", esc.get(), out.c_str()), 0) << v;
-        EXPECT_EQ(SysRoot::read("/echo-out"), v);
-    }
+    const std::string v = "$(touch " + canary + ")`touch " + canary + "`\"; touch " + canary + "; $HOME\t\n'q' \\";
+    const korv::c_buffer esc(str_insert_back_slash(v.c_str()));
+    ASSERT_NE(esc, nullptr);
+    EXPECT_EQ(System("printf '%%s' \"%s\" > %s", esc.get(), out.c_str()), 0);
+    EXPECT_EQ(SysRoot::read("/echo-out"), v);
     EXPECT_NE(::access(canary.c_str(), F_OK), 0) << "a value ran as a command";
 }
 

@@ -151,9 +151,7 @@ bytes isns_attr_raw(uint32_t tag, const bytes &value)
 bytes isns_attr_str(uint32_t tag, const std::string &text)
 {
     bytes v(text.begin(), text.end());
-    do
-        v.push_back(0);
-    while (v.size() % 4);
+    v.resize(text.size() / 4 * 4 + 4);  // at least one NUL, then to a multiple of 4
     return isns_attr_raw(tag, v);
 }
 
