@@ -220,6 +220,7 @@ TEST_F(LioTarget, EnableAndDisable)
 {
     // Missing from the kernel: the enable switch cannot be read, which counts
     // as enabled; enabling does not make the target.
+    EXPECT_EQ(lio3_set_target_attr_dataout_timeout(7, t_.get()), ERR_TARGET_NOT_IN_KERNEL);
     EXPECT_EQ(lio3_enable_target(t_.get()), 0);
     EXPECT_FALSE(exists(kIscsi + "/" + t_->iqn));
 
