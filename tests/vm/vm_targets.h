@@ -12,6 +12,7 @@
 #include <cstdio>
 #include <filesystem>
 #include <fstream>
+#include <sstream>
 #include <iterator>
 #include <memory>
 #include <string>
@@ -127,8 +128,11 @@ inline bool exists(const std::string &path) { return inode_of(path) != 0; }
 // The file's text as the kernel gives it (line end included).
 inline std::string slurp(const std::string &path)
 {
+    // A /proc file whose process is reaped mid-read fails the read itself;
+    // streaming the buffer turns that into failbit instead of a throw.
     std::ifstream in(path);
-    return in ? std::string(std::istreambuf_iterator<char>(in), {}) : "<unreadable: " + path + ">";
+    std::ostringstream text;
+    return in && text << in.rdbuf() ? text.str() : "<unreadable: " + path + ">";
 }
 
 // A value written the way an operator would: 0 when the kernel took it.
