@@ -21,22 +21,16 @@ namespace {
 template <class T>
 T *alloc_record(const char *type_name)
 {
-    auto *rec = static_cast<T *>(std::calloc(1, sizeof(T)));
-    if (!rec) {
+    T *rec = korv::list_record_new(&T::node);
+    if (!rec)
         DBG(0, "malloc %s failed", type_name);
-        return nullptr;
-    }
-    list_node_init(&rec->node, rec);
     return rec;
 }
 
 template <class T>
 void free_record(T *rec)
 {
-    if (!rec)
-        return;
-    list_remove(&rec->node);
-    std::free(rec);
+    korv::list_record_free(rec, &T::node);
 }
 
 // Frees every record of a list through its type's own free.

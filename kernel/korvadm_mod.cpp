@@ -18,13 +18,12 @@ const iscsi_mod_ops_t *iscsi_mod_ops = nullptr;
 
 iscsi_target_t *iscsi_target_new(void)
 {
-    auto *t = static_cast<iscsi_target_t *>(std::calloc(1, sizeof(iscsi_target_t)));
+    iscsi_target_t *t = korv::list_record_new(&iscsi_target_t::node);
     if (!t)
         return nullptr;
     t->tpgt = -1;
     list_init(&t->ip_list);
     list_init(&t->sess_list);
-    list_node_init(&t->node, t);
     return t;
 }
 
@@ -50,47 +49,19 @@ int iscsi_target_cmp(const iscsi_target_t *lhs, const iscsi_target_t *rhs)
 
 iscsi_lun_t *iscsi_lun_new(void)
 {
-    auto *l = static_cast<iscsi_lun_t *>(std::calloc(1, sizeof(iscsi_lun_t)));
+    iscsi_lun_t *l = korv::list_record_new(&iscsi_lun_t::node);
     if (!l)
         return nullptr;
     l->lun_num = -1;
     l->hba_id = -1;
-    list_node_init(&l->node, l);
     return l;
 }
 
-void iscsi_lun_free(iscsi_lun_t *lun)
-{
-    if (!lun)
-        return;
-    list_remove(&lun->node);
-    std::free(lun);
-}
-
-namespace {
-// A zeroed record of type T with its list node owned by itself.
-template <class T>
-T *new_record()
-{
-    auto *r = static_cast<T *>(std::calloc(1, sizeof(T)));
-    if (r)
-        list_node_init(&r->node, r);
-    return r;
-}
-
-template <class T>
-void free_record(T *r)
-{
-    if (!r)
-        return;
-    list_remove(&r->node);
-    std::free(r);
-}
-}  // namespace
+void iscsi_lun_free(iscsi_lun_t *lun) { korv::list_record_free(lun, &iscsi_lun_t::node); }
 
 iscsi_initiator_t *iscsi_initiator_new(void)
 {
-    iscsi_initiator_t *i = new_record<iscsi_initiator_t>();
+    iscsi_initiator_t *i = korv::list_record_new(&iscsi_initiator_t::node);
     if (i)
         list_init(&i->sess_list);
     return i;
@@ -100,7 +71,7 @@ void iscsi_initiator_free(iscsi_initiator_t *initiator)
 {
     if (initiator)
         iscsi_sess_detach_list(&initiator->sess_list);
-    free_record(initiator);
+    korv::list_record_free(initiator, &iscsi_initiator_t::node);
 }
 
 void iscsi_initiator_free_list(list_t *list)
@@ -147,7 +118,7 @@ iscsi_initiator_t *iscsi_initiator_list_add(list_t *list, const char *name)
 
 iscsi_map_lun_t *iscsi_map_lun_new(void)
 {
-    iscsi_map_lun_t *m = new_record<iscsi_map_lun_t>();
+    iscsi_map_lun_t *m = korv::list_record_new(&iscsi_map_lun_t::node);
     if (m)
         m->lun_num = -1;
     return m;
@@ -155,17 +126,17 @@ iscsi_map_lun_t *iscsi_map_lun_new(void)
 
 void iscsi_map_lun_free(iscsi_map_lun_t *map_lun)
 {
-    free_record(map_lun);
+    korv::list_record_free(map_lun, &iscsi_map_lun_t::node);
 }
 
 iscsi_lun_acl_t *iscsi_lun_acl_new(void)
 {
-    return new_record<iscsi_lun_acl_t>();
+    return korv::list_record_new(&iscsi_lun_acl_t::node);
 }
 
 void iscsi_lun_acl_free(iscsi_lun_acl_t *lun_acl)
 {
-    free_record(lun_acl);
+    korv::list_record_free(lun_acl, &iscsi_lun_acl_t::node);
 }
 
 /* -------------------------------------------------------------- selection */

@@ -34,13 +34,12 @@ char *dup_text(const char *s, bool &ok)
 
 iscsi_sess_t *iscsi_sess_new(void)
 {
-    auto *s = static_cast<iscsi_sess_t *>(std::calloc(1, sizeof(iscsi_sess_t)));
+    iscsi_sess_t *s = korv::list_record_new(&iscsi_sess_t::node);
     if (!s) {
         DBG(0, "malloc iscsi_sess_t failed");
         return nullptr;
     }
     s->tsih = -1;
-    list_node_init(&s->node, s);
     list_node_init(&s->initiator_node, s);
     list_node_init(&s->target_node, s);
     list_init(&s->conn_list);
@@ -157,13 +156,12 @@ int iscsi_sess_get_target_session(list_t *sess_list, list_t *initiator_list, isc
 
 iscsi_conn_t *iscsi_conn_new(void)
 {
-    auto *c = static_cast<iscsi_conn_t *>(std::calloc(1, sizeof(iscsi_conn_t)));
+    iscsi_conn_t *c = korv::list_record_new(&iscsi_conn_t::node);
     if (!c) {
         DBG(0, "malloc iscsi_conn_t failed");
         return nullptr;
     }
     c->cid = -1;
-    list_node_init(&c->node, c);
     return c;
 }
 
