@@ -104,30 +104,16 @@ TEST(XmldbBadInput, GarbageAndOversizedFramesAreRefusedAndNeverTakeTheServiceDow
     XmldbService db;
     ASSERT_EQ(xmldbc_set(S, 0, "/k", "v"), 0);
     RawClient c;
-    // A path length beyond the payload, an unknown operation, a NUL inside
-    // the path, a path over the limit.
-    for (const std::string &bad :
-         {be32(5) + "xAAAA", be32(6) + "z" + be32(1) + "/", be32(8) + "g" + be32(3) + std::string("/\0k", 3)}) {
+    // A payload too short for its own header, a path length beyond the
+    // payload, an unknown operation, a NUL inside the path, a path over the
+    // limit.
+    for (const std::string &bad : {be32(4) + std::string("g\0\0\0", 4), be32(5) + "xAAAA",
+                                   be32(6) + "z" + be32(1) + "/", be32(8) + "g" + be32(3) + std::string("/\0k", 3)}) {
         c.send(bad);
         EXPECT_EQ(c.answer()[0], xmldb::kFail);
     }
     EXPECT_EQ(c.ask(xmldb::Op::Set, "/" + std::string(xmldb::kPathMax, 'p'), "v")[0], xmldb::kFail);
     EXPECT_EQ(c.ask(xmldb::Op::Get, "/k"), kOk + "v");
-
-    std::mt19937 rng(7);
-    for (int conn = 0; conn < 20; ++conn) {
-        RawClient r;
-        for (int i = 0; i < 25; ++i) {
-            // Well-framed but random inside: any op byte, any path length field.
-            std::string payload(1 + rng() % 64, '\0');
-            std::generate(payload.begin(), payload.end(), [&] { return static_cast<char>(rng()); });
-            std::string a = r.send(be32(static_cast<uint32_t>(payload.size())) + payload) ? r.answer() : "";
-            if (a.empty())
-                break;  // the service may hang up; it must not die
-            ASSERT_TRUE(a[0] == xmldb::kOk || a[0] == xmldb::kFail);
-        }
-    }
-    EXPECT_EQ(xmldb_get("/k"), "v");
 
     // Lengths that cannot be skipped: refused once, then the connection closes.
     for (uint32_t len : {0u, 0xffffffffu, static_cast<uint32_t>(xmldb::kRequestMax + 1)}) {

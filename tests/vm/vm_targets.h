@@ -12,9 +12,8 @@
 #include <cstdio>
 #include <filesystem>
 #include <fstream>
-#include <sstream>
-#include <iterator>
 #include <memory>
+#include <sstream>
 #include <string>
 #include <vector>
 
@@ -28,20 +27,15 @@ const std::string kCore = "/sys/kernel/config/target/core";
 // The target modules, in the order they load.
 constexpr const char *kModules[] = {"target_core_mod", "target_core_file", "iscsi_target_mod"};
 
-struct TargetFree {
-    void operator()(iscsi_target_t *t) const { iscsi_target_free(t); }
-};
-using Target = std::unique_ptr<iscsi_target_t, TargetFree>;
+using Target = std::unique_ptr<iscsi_target_t, decltype([](iscsi_target_t *t) { iscsi_target_free(t); })>;
 
-// A target record with IQN, alias and tag (NULL only when out of memory).
+// A target record with IQN, alias and tag.
 inline Target make_target(const std::string &iqn, int tpgt, const std::string &alias = "vm alias")
 {
     Target t(iscsi_target_new());
-    if (t) {
-        std::snprintf(t->iqn, sizeof t->iqn, "%s", iqn.c_str());
-        std::snprintf(t->alias, sizeof t->alias, "%s", alias.c_str());
-        t->tpgt = tpgt;
-    }
+    std::snprintf(t->iqn, sizeof t->iqn, "%s", iqn.c_str());
+    std::snprintf(t->alias, sizeof t->alias, "%s", alias.c_str());
+    t->tpgt = tpgt;
     return t;
 }
 
@@ -50,19 +44,16 @@ inline std::string tpg_dir(const iscsi_target_t *t)
     return kIscsi + "/" + t->iqn + "/tpgt_" + std::to_string(t->tpgt);
 }
 
-// Appends one wanted portal to the target's list; false when out of memory.
-inline bool want_portal(iscsi_target_t *t, const std::string &ipv4, const std::string &ipv6, int port,
+// Appends one wanted portal to the target's list.
+inline void want_portal(iscsi_target_t *t, const std::string &ipv4, const std::string &ipv6, int port,
                         const std::string &dev = "")
 {
     iscsi_ip_t *ip = iscsi_ip_new();
-    if (!ip)
-        return false;
     std::snprintf(ip->ipv4, sizeof ip->ipv4, "%s", ipv4.c_str());
     std::snprintf(ip->ipv6, sizeof ip->ipv6, "%s", ipv6.c_str());
     std::snprintf(ip->dev_name, sizeof ip->dev_name, "%s", dev.c_str());
     ip->port = port;
     list_append(&ip->node, &t->ip_list);
-    return true;
 }
 
 // A fileio LUN record, not yet mapped.
@@ -98,7 +89,7 @@ inline Target serve(const std::string &iqn, const std::string &ipv4, const std::
 {
     Target t = make_target(iqn, 1);
     EXPECT_EQ(iscsi_mod_add_target(t.get()), 0);
-    EXPECT_TRUE(want_portal(t.get(), ipv4, ipv6, 3260));
+    want_portal(t.get(), ipv4, ipv6, 3260);
     EXPECT_EQ(iscsi_mod_set_target_ip(t.get()), 0);
     EXPECT_EQ(iscsi_mod_set_target_chap(t.get()), 0);
     return t;
