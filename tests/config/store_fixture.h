@@ -8,6 +8,7 @@
 #include <functional>
 #include <memory>
 #include <string>
+#include <type_traits>
 
 #include <gtest/gtest.h>
 
@@ -33,13 +34,13 @@ inline std::string epath(const std::string &root, int n, const std::string &fiel
 }
 
 // Values joined with "/", numbers in decimal.
-inline std::string text(const char *s) { return s; }
-inline std::string text(char *s) { return s; }
-inline std::string text(const std::string &s) { return s; }
 template <class T>
-std::string text(T v)
+std::string text(const T &v)
 {
-    return std::to_string(v);
+    if constexpr (std::is_convertible_v<const T &, std::string>)
+        return std::string(v);
+    else
+        return std::to_string(v);
 }
 template <class... A>
 std::string slash(const A &...a)
@@ -126,21 +127,17 @@ protected:
     }
     static std::string tpath(int id, const char *field) { return epath("/iscsi/target", id, field); }
     static std::string lpath(int id, const char *field) { return epath("/iscsi/lun", id, field); }
-    // Writes a target entry directly, as another writer of the store would.
-    static void put_target(int id, const std::string &name, int tpgt = 1, int hba_id = 0)
-    {
-        put(tpath(id, "name"), name);
-        put(tpath(id, "iqn"), "iqn.2000-01.com.example:" + name);
-        put(tpath(id, "tpgt"), std::to_string(tpgt));
-        put(tpath(id, "hba_id"), std::to_string(hba_id));
-        put(tpath(id, "state"), "0");
-        put(tpath(id, "chap_enable"), "0");
-    }
 
     XmldbService &db() { return db_; }
 
 private:
     XmldbService db_;  // one fresh service per test
+};
+
+// The store of data/unmapped.xml: targets t1 and t2, LUNs l1 to l4.
+class SampleStore : public StoreTest {
+protected:
+    SampleStore() : StoreTest(data_file("unmapped.xml")) {}
 };
 
 }  // namespace korv_test

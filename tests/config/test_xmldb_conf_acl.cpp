@@ -7,9 +7,8 @@ using namespace korv_test;
 
 namespace {
 
-class Acl : public StoreTest {
+class Acl : public SampleStore {
 protected:
-    Acl() : StoreTest(data_file("unmapped.xml")) {}
     // Both sides as text: per initiator "iqn(alias)=lun:right,...", then per
     // LUN "lun=iqn:right,...", each list with its stored count.
     static std::string sides()

@@ -61,9 +61,8 @@ private:
     child_process proc_;  // stopped with the proxy
 };
 
-class Mapping : public StoreTest {
+class Mapping : public SampleStore {
 protected:
-    Mapping() : StoreTest(data_file("unmapped.xml")) {}
     // The target's map as "lun_name:lun_num ...", with its count.
     static std::string map_of(int t)
     {

@@ -170,12 +170,10 @@ TEST_F(HostileStore, CountsAreBoundedAndBrokenRecordsSkippedEverywhere)
     EXPECT_EQ(raw("/iscsi/lun/count"), "3");
 }
 
-using FullStore = StoreTest;
+using FullStore = SampleStore;
 
 TEST_F(FullStore, EveryReaderReturnsEveryRecordOfFullTables)
 {
-    put_target(1, "t1");
-    put_target(2, "t2");
     for (int n = 1; n <= 128; n++) {
         const std::string name = "l" + std::to_string(n);
         put(lpath(n, "name"), name);

@@ -53,49 +53,49 @@ TEST_F(Targets, AddRefusesInvalidRecordsBeforeAnyWrite)
     EXPECT_EQ(quiet([&] { return xmldb_add_new_target(nullptr); }), ERR_PARAM);
 }
 
-TEST_F(Targets, FieldsAreReadAndWrittenByNameIncludingChapAndConnections)
+using NamedTargets = SampleStore;
+
+TEST_F(NamedTargets, FieldsAreReadAndWrittenByNameIncludingChapAndConnections)
 {
-    put_target(1, "alpha", 2, 4);
-    put_target(2, "beta", 5, 6);
     int v = 0;
-    EXPECT_EQ(slash(xmldb_get_target_tpgt(&v, "beta"), v), "0/5");
-    EXPECT_EQ(xmldb_set_target_state(9, "beta"), KORV_OK);
-    EXPECT_EQ(xmldb_set_target_hba_id(11, "alpha"), KORV_OK);
-    EXPECT_EQ(xmldb_set_target_status("Ready", "alpha"), KORV_OK);
-    EXPECT_EQ(xmldb_set_target_iqn("iqn.2000-01.com.example:new", "alpha"), KORV_OK);
+    EXPECT_EQ(slash(xmldb_get_target_tpgt(&v, "t2"), v), "0/5");
+    EXPECT_EQ(xmldb_set_target_state(9, "t2"), KORV_OK);
+    EXPECT_EQ(xmldb_set_target_hba_id(11, "t1"), KORV_OK);
+    EXPECT_EQ(xmldb_set_target_status("Ready", "t1"), KORV_OK);
+    EXPECT_EQ(xmldb_set_target_iqn("iqn.2000-01.com.example:new", "t1"), KORV_OK);
     EXPECT_EQ(slash(raw(tpath(2, "state")), raw(tpath(1, "hba_id")), raw(tpath(1, "status"))), "9/11/Ready");
     char buf[CONF_IQN_LEN];
-    EXPECT_EQ(slash(xmldb_get_target_iqn(buf, sizeof buf, "alpha"), buf), "0/iqn.2000-01.com.example:new");
+    EXPECT_EQ(slash(xmldb_get_target_iqn(buf, sizeof buf, "t1"), buf), "0/iqn.2000-01.com.example:new");
 
     // A missing name is "not found" except for the IQN, which reports a parameter error.
-    EXPECT_EQ(quiet([&] { return xmldb_set_target_state(1, "gamma"); }), ERR_NOT_FOUND);
-    EXPECT_EQ(quiet([&] { return xmldb_get_target_iqn(buf, sizeof buf, "gamma"); }), ERR_PARAM);
-    EXPECT_EQ(logged([&] { return xmldb_get_target_status(buf, CONF_NAME_LEN - 1, "alpha"); },
+    EXPECT_EQ(quiet([&] { return xmldb_set_target_state(1, "t9"); }), ERR_NOT_FOUND);
+    EXPECT_EQ(quiet([&] { return xmldb_get_target_iqn(buf, sizeof buf, "t9"); }), ERR_PARAM);
+    EXPECT_EQ(logged([&] { return xmldb_get_target_status(buf, CONF_NAME_LEN - 1, "t1"); },
                      "parameter length error"),
               ERR_PARAM);
     put(tpath(2, "tpgt"), "");
-    EXPECT_EQ(quiet([&] { return xmldb_get_target_tpgt(&v, "beta"); }), ERR_INT_VALUE);
+    EXPECT_EQ(quiet([&] { return xmldb_get_target_tpgt(&v, "t2"); }), ERR_INT_VALUE);
 
     // The CHAP switch writes or clears the credentials; a bad switch writes nothing.
     auto chap = [&] {
         return slash(raw(tpath(1, "chap_enable")), raw(tpath(1, "chap_name")), raw(tpath(1, "chap_pwd")));
     };
-    EXPECT_EQ(xmldb_set_target_chap(1, "u", "pw", "alpha"), KORV_OK);
+    EXPECT_EQ(xmldb_set_target_chap(1, "u", "pw", "t1"), KORV_OK);
     EXPECT_EQ(chap(), "1/u/pw");
-    EXPECT_EQ(xmldb_set_target_chap(0, "ignored", "ignored", "alpha"), KORV_OK);
-    EXPECT_EQ(quiet([&] { return xmldb_set_target_chap(2, "u", "p", "alpha"); }), ERR_PARAM);
+    EXPECT_EQ(xmldb_set_target_chap(0, "ignored", "ignored", "t1"), KORV_OK);
+    EXPECT_EQ(quiet([&] { return xmldb_set_target_chap(2, "u", "p", "t1"); }), ERR_PARAM);
     EXPECT_EQ(quiet([&] { return xmldb_set_target_chap(1, "u", "p", "nobody"); }), ERR_NOT_FOUND);
     EXPECT_EQ(chap(), "0//");
 
     // Connection records go alone; the target stays.
-    EXPECT_EQ(xmldb_set_target_conn_info("alpha", 2, "192.0.2.5", "iqn.1994-05.com.example:init"), KORV_OK);
+    EXPECT_EQ(xmldb_set_target_conn_info("t1", 2, "192.0.2.5", "iqn.1994-05.com.example:init"), KORV_OK);
     EXPECT_EQ(slash(raw(tpath(1, "conn_info/conn:2/ip")), raw(tpath(1, "conn_info/conn:2/iqn"))),
               "192.0.2.5/iqn.1994-05.com.example:init");
     EXPECT_EQ(xmldb_set_target_conn_info("zz", 1, "x", "y"), ID_ENTRY_NOT_FOUND);
-    EXPECT_EQ(xmldb_del_target_conn_info("alpha"), KORV_OK);
-    EXPECT_EQ(slash(raw(tpath(1, "conn_info/conn:2/ip")), raw(tpath(1, "name")), xmldb_check_target_exist("alpha"),
+    EXPECT_EQ(xmldb_del_target_conn_info("t1"), KORV_OK);
+    EXPECT_EQ(slash(raw(tpath(1, "conn_info/conn:2/ip")), raw(tpath(1, "name")), xmldb_check_target_exist("t1"),
                     xmldb_check_target_exist("")),  // "": a plain "no", never a truthy code
-              "/alpha/1/0");
+              "/t1/1/0");
 }
 
 namespace {
