@@ -134,10 +134,14 @@ private:
     XmldbService db_;  // one fresh service per test
 };
 
-// The store of data/unmapped.xml: targets t1 and t2, LUNs l1 to l4.
-class SampleStore : public StoreTest {
+// A store that starts with the tree of a data file: LoadedStore<kName>.
+template <const char *File>
+class LoadedStore : public StoreTest {
 protected:
-    SampleStore() : StoreTest(data_file("unmapped.xml")) {}
+    LoadedStore() : StoreTest(data_file(File)) {}
 };
+// data/unmapped.xml: targets t1 and t2, LUNs l1 to l4.
+inline constexpr char kUnmapped[] = "unmapped.xml";
+using SampleStore = LoadedStore<kUnmapped>;
 
 }  // namespace korv_test

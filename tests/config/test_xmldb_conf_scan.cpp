@@ -133,12 +133,8 @@ TEST_F(Lists, OnlyADeadServiceFailsAWholeReadAndNothingIsHandedOut)
               "");
 }
 
-namespace {
-class HostileStore : public StoreTest {
-protected:
-    HostileStore() : StoreTest(data_file("hostile.xml")) {}
-};
-}  // namespace
+constexpr char kHostile[] = "hostile.xml";
+using HostileStore = LoadedStore<kHostile>;
 
 TEST_F(HostileStore, CountsAreBoundedAndBrokenRecordsSkippedEverywhere)
 {

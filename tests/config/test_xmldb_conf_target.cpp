@@ -98,12 +98,8 @@ TEST_F(NamedTargets, FieldsAreReadAndWrittenByNameIncludingChapAndConnections)
               "/t1/1/0");
 }
 
-namespace {
-class BrokenTargets : public StoreTest {
-protected:
-    BrokenTargets() : StoreTest(data_file("targets_broken.xml")) {}
-};
-}  // namespace
+constexpr char kBroken[] = "targets_broken.xml";
+using BrokenTargets = LoadedStore<kBroken>;
 
 TEST_F(BrokenTargets, ReadersSkipBrokenRecordsAndFillEveryFieldChapOnlyWhenOn)
 {

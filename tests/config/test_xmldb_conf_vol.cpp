@@ -1,11 +1,10 @@
 // SPDX-License-Identifier: Apache-2.0
 // The per-volume summaries under "/iscsi/lun/total_size": lookup by UUID and
 // the rewrite from a volume list, checked against whole dumps of the store.
-#include <cstdio>
-#include <cstring>
 #include <fstream>
 #include <sstream>
 
+#include "common/korvadm_str.h"
 #include "common/korvadm_sys.h"
 #include "tests/config/store_fixture.h"
 
@@ -28,33 +27,30 @@ std::string data(const std::string &name)
 std::string dump(const std::string &path)
 {
     std::string out;
-    std::FILE *p = popen((korv_test::xmldbc_binary() + " dump " + path).c_str(), "r");
-    for (char l[512]; p && std::fgets(l, sizeof l, p);)
-        if (std::strstr(l, " = "))
-            out += l;
-    if (p)
-        pclose(p);
+    korv::read_command_lines((korv_test::xmldbc_binary() + " dump " + path).c_str(), [&](std::string_view l) {
+        if (l.find(" = ") != std::string_view::npos)
+            out.append(l).append("\n");
+        return true;
+    });
     return out;
 }
 
-class VolSummaries : public korv_test::StoreTest {
+constexpr char kBefore[] = "vol_summaries_before.xml";
+
+class VolSummaries : public korv_test::LoadedStore<kBefore> {
 protected:
     void SetUp() override
     {
-        std::istringstream in(data("vol_summaries_before.txt")), vols(data("vol_summaries_volumes.txt"));
-        for (std::string l; std::getline(in, l);)
-            put(l.substr(0, l.find(" = ")), l.substr(l.find(" = ") + 3));
-        list_init(&vols_);
+        std::istringstream vols(data("vol_summaries_volumes.txt"));
         for (std::string l; std::getline(vols, l);) {
             vol_info_t *v = vol_info_new();
             ASSERT_NE(v, nullptr);
             std::istringstream(l) >> v->uuid >> v->mnt_path >> v->vol_size >> v->alloc_size >> v->claim_alloc_size >>
                 v->free_size >> v->claim_free_size >> v->keep_figures;
-            list_append(&v->node, &vols_);
+            list_append(&v->node, vols_.get());
         }
     }
-    void TearDown() override { vol_info_free_list(&vols_); }
-    list_t vols_;
+    korv::list_owner vols_{vol_info_free_list};
 };
 
 TEST_F(VolSummaries, FoundByUuid)
@@ -70,10 +66,10 @@ TEST_F(VolSummaries, FoundByUuid)
 
 TEST_F(VolSummaries, RewriteKeepsStoredAllocationsAndTotals)
 {
-    EXPECT_EQ(quiet([&] { return iscsi_conf_ops.xmldb_update_total_vol_size_info(&vols_); }), 0);
+    EXPECT_EQ(quiet([&] { return iscsi_conf_ops.xmldb_update_total_vol_size_info(vols_.get()); }), 0);
     EXPECT_EQ(dump("/iscsi/lun"), data("vol_summaries_after.txt"));
-    vol_info_free_list(&vols_);
-    EXPECT_EQ(quiet([&] { return xmldb_update_total_vol_size_info(&vols_); }), 0);
+    vol_info_free_list(vols_.get());
+    EXPECT_EQ(quiet([&] { return xmldb_update_total_vol_size_info(vols_.get()); }), 0);
     EXPECT_EQ(dump("/iscsi/lun"), data("vol_summaries_empty.txt"));
 }
 
@@ -81,7 +77,7 @@ TEST_F(VolSummaries, FailingWritesGiveUpAfterThreeAttempts)
 {
     db().stop();
     std::string log;
-    EXPECT_EQ(quiet([&] { return xmldb_update_total_vol_size_info(&vols_); }, &log), ERR_DB_WRITE);
+    EXPECT_EQ(quiet([&] { return xmldb_update_total_vol_size_info(vols_.get()); }, &log), ERR_DB_WRITE);
     size_t attempts = 0;
     for (size_t at = 0; (at = log.find("xmldbc_set(/iscsi/lun/total_size/id:1/uuid) failed \n", at)) != std::string::npos;
          ++at)
