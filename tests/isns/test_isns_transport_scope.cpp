@@ -34,37 +34,35 @@ int why(int rc, const std::string &reason)
     return rc;
 }
 
-// In the child: interfaces, a server on fe80::1 held by `holder` (none: ""),
-// then the connect to `server`; 0 when it went through holder (none: failed)
-// in time.
+// In the child: the interfaces (dummy where the kernel has it, else ifb:
+// both drop what they send), a server on fe80::1 held by `holder` (none: ""),
+// a global server's network on the first interface, then the connect to
+// `server`; 0 when it went through holder (none: failed) in time.
 int scope_case(const std::vector<std::string> &ifaces, const std::string &holder, const char *server, double min_s)
 {
-    if (geteuid() != 0 || unshare(CLONE_NEWNET) != 0 || !sh("ip link set lo up"))
-        return why(kSkip, "needs root and unshare(CLONE_NEWNET) for a private network namespace");
-    for (const std::string &i : ifaces)  // dummy where the kernel has it, else ifb: both drop what they send
-        if (!(sh("ip link add " + i + " type dummy") || sh("ip link add " + i + " type ifb")) ||
-            !sh("ip link set " + i + " up"))
-            return why(kSkip, "cannot create and bring up a dummy or ifb interface " + i);
+    const int family = std::strchr(server, ':') ? AF_INET6 : AF_INET;
+    std::string setup = "ip link set lo up", routes = "true";
+    for (const std::string &i : ifaces) {
+        setup += " && { ip link add " + i + " type dummy || ip link add " + i + " type ifb; } && ip link set " + i + " up";
+        routes += " && ip -6 route show dev " + i + " | grep -q '^fe80::/64'";
+    }
+    if (!holder.empty()) {
+        setup += " && ip -6 addr add fe80::1/64 dev " + holder + " nodad";
+        routes += " && ip -6 route show table local dev " + holder + " | grep -q '^local fe80::1 '";
+    }
+    if (std::strcmp(server, "fe80::1") != 0)
+        setup += std::string(" && ip addr add ") + (family == AF_INET ? "192.0.2.1/24" : "2001:db8::1/64 nodad") +
+                 " dev " + ifaces[0];
+    if (geteuid() != 0 || unshare(CLONE_NEWNET) != 0 || !sh(setup))
+        return why(kSkip, "needs root, a private network namespace and dummy or ifb interfaces: " + setup);
     int lfd = socket(AF_INET6, SOCK_STREAM, 0);
     sockaddr_in6 sa{AF_INET6, htons(3205), 0, {}, if_nametoindex(holder.c_str())};
     inet_pton(AF_INET6, "fe80::1", &sa.sin6_addr);
-    if (!holder.empty() && (!sh("ip -6 addr add fe80::1/64 dev " + holder + " nodad") ||
-                            bind(lfd, reinterpret_cast<sockaddr *>(&sa), sizeof sa) != 0 || listen(lfd, 4) != 0))
+    if (!holder.empty() && (bind(lfd, reinterpret_cast<sockaddr *>(&sa), sizeof sa) != 0 || listen(lfd, 4) != 0))
         return why(kSkip, "cannot listen on fe80::1%" + holder);
-    // A global server's network is on the first interface.
-    const int family = std::strchr(server, ':') ? AF_INET6 : AF_INET;
-    const std::string net = family == AF_INET ? "192.0.2.1/24" : "2001:db8::1/64 nodad";
-    if (std::strcmp(server, "fe80::1") != 0 && !sh("ip addr add " + net + " dev " + ifaces[0]))
-        return why(kSkip, "cannot add " + net + " to " + ifaces[0]);
     // The kernel adds each interface's fe80::/64 route a little after the link
     // comes up; measuring before that would see instant failures, not time-outs.
-    bool routes = false;
-    for (int i = 0; i < 500 && !routes; i++, usleep(20 * 1000)) {
-        routes = holder.empty() || sh("ip -6 route show table local dev " + holder + " | grep -q '^local fe80::1 '");
-        for (const std::string &dev : ifaces)
-            routes = routes && sh("ip -6 route show dev " + dev + " | grep -q '^fe80::/64'");
-    }
-    if (!routes)
+    if (!korv_test::eventually([&] { return sh(routes); }, std::chrono::seconds(10)))
         return why(1, "link-local routes did not appear within 10 s");
     int fd = -1;
     const auto [rc, s] = isns_test::timed([&] { return isns_connect(&fd, family, server, 3205); });
