@@ -37,12 +37,10 @@ std::vector<int> keys(const list_t &l)
     std::vector<int> out;
     const list_node_t *prev = nullptr;
     for (const list_node_t *n = l.head; n; prev = n, n = list_next(n)) {
-        EXPECT_EQ(n->prev, prev);
-        EXPECT_EQ(n->list, &l);
+        EXPECT_TRUE(n->prev == prev && n->list == &l) << "links of node " << out.size();
         out.push_back(static_cast<rec_t *>(n->owner)->key);
     }
-    EXPECT_EQ(l.tail, prev);
-    EXPECT_EQ(l.count, static_cast<int>(out.size()));
+    EXPECT_TRUE(l.tail == prev && l.count == static_cast<int>(out.size())) << "tail or count";
     EXPECT_EQ(list_is_empty(&l) != 0, out.empty());
     return out;
 }

@@ -11,7 +11,6 @@
 #include <cstring>
 #include <filesystem>
 #include <fstream>
-#include <sstream>
 
 #include <gtest/gtest.h>
 
@@ -75,12 +74,12 @@ TEST_F(Storage, DfOutputIsSharedOrRefused)
 {
     for (const auto &[out, want] : cases("df_lines.txt")) {
         standin("df", "Filesystem 1B-blocks Used Available Use% Mounted on\\n" + out);
-        std::istringstream w(want);
-        int rc;
-        U64s expected(3), got(3, 7);
-        w >> rc >> expected[0] >> expected[1] >> expected[2];
-        EXPECT_EQ(quiet([&] { return _sys_get_df_info(&got[0], &got[1], &got[2], "/"); }), rc) << out;
-        EXPECT_EQ(got, rc ? U64s(3, 7) : expected) << out;
+        U64s got(3, 7);  // left as they are on failure
+        const int rc = quiet([&] { return _sys_get_df_info(&got[0], &got[1], &got[2], "/"); });
+        std::string text = std::to_string(rc);
+        for (uint64_t v : got)
+            text += " " + std::to_string(v);
+        EXPECT_EQ(text, rc ? want + " 7 7 7" : want) << out;
     }
     // df runs only on a mount point, and only with all its outputs.
     SysRoot::remove("/standin/calls.log");
@@ -181,7 +180,7 @@ protected:
     std::string subst(std::string text) const
     {
         for (const auto &[from, to] : {std::pair{"@EXT4@", ext4_}, {"@TMPFS@", tmpfs_}, {"@NONE@", none_}})
-            if (size_t at = text.find(from); at != std::string::npos)
+            for (size_t at; (at = text.find(from)) != std::string::npos;)
                 text.replace(at, std::strlen(from), to);
         return text;
     }
@@ -199,17 +198,12 @@ protected:
 
 TEST_F(RealMounts, MountPathAndLockStateByUuid)
 {
-    for (auto [uuid, want] : cases("mount_lookups.txt")) {
-        uuid = uuid == "\"\"" ? "" : uuid;
-        std::istringstream w(subst(want));
-        int found, unlocked;
-        std::string path;
-        w >> found >> path >> unlocked;
+    for (const auto &[uuid, want] : cases("mount_lookups.txt")) {
         char out[VOL_MNT_PATH_LEN] = "stale";
-        const char *id = uuid.c_str();  // clang 14 cannot capture a structured binding
-        EXPECT_EQ(quiet([&] { return sys_raid_get_mnt_path_by_uuid(out, sizeof out, id); }), found) << uuid;
-        EXPECT_EQ(out, path == "-" ? "" : path) << uuid;
-        EXPECT_EQ(quiet([&] { return sys_raid_vol_is_unlocked_by_uuid(id); }), unlocked) << uuid;
+        const char *id = uuid == "\"\"" ? "" : uuid.c_str();  // clang 14 cannot capture a structured binding
+        const int found = quiet([&] { return sys_raid_get_mnt_path_by_uuid(out, sizeof out, id); });
+        const int unlocked = quiet([&] { return sys_raid_vol_is_unlocked_by_uuid(id); });
+        EXPECT_EQ(std::to_string(found) + " " + (*out ? out : "-") + " " + std::to_string(unlocked), subst(want)) << uuid;
     }
     char small[8];
     EXPECT_EQ(quiet([&] { return sys_raid_get_mnt_path_by_uuid(small, sizeof small, "u-ext4"); }), 6);
@@ -217,37 +211,32 @@ TEST_F(RealMounts, MountPathAndLockStateByUuid)
 
 TEST_F(RealMounts, VolumeListAndRootChainEndToEnd)
 {
-    list_t list;
-    list_init(&list);
-    ASSERT_EQ(quiet([&] { return get_vol_info_list(&list); }), 0);
-    std::vector<std::string> got;
-    for (vol_info_t *v : korv::list_records<vol_info_t>(&list))
-        got.push_back(std::string(v->uuid) + " " + v->mnt_path + " " + std::to_string(v->vol_size + v->free_size));
-    EXPECT_EQ(got, std::vector<std::string>({"u-ext4 " + ext4_ + " 0", "u-tmpfs " + tmpfs_ + " 0", "u-locked " + none_ + " 0",
-                                             "u-dup " + tmpfs_ + " 0", "u-dup " + ext4_ + " 0", "u-dup2 " + none_ + " 0",
-                                             "u-dup2 " + tmpfs_ + " 0"}));
-    EXPECT_EQ(quiet([&] { return get_vol_info_list(&list); }), ERR_PARAM);  // not empty
-    vol_info_free_list(&list);
+    korv::list_owner list(vol_info_free_list);
+    ASSERT_EQ(quiet([&] { return get_vol_info_list(list.get()); }), 0);
+    std::string got;
+    for (vol_info_t *v : korv::list_records<vol_info_t>(list.get()))
+        got += std::string(v->uuid) + " " + v->mnt_path + ";";
+    EXPECT_EQ(got, subst("u-ext4 @EXT4@;u-tmpfs @TMPFS@;u-locked @NONE@;u-dup @TMPFS@;u-dup @EXT4@;u-dup2 @NONE@;"
+                         "u-dup2 @TMPFS@;"));
+    EXPECT_EQ(quiet([&] { return get_vol_info_list(list.get()); }), ERR_PARAM);  // not empty
 
+    // The walk's result, then uuid, mount path and sleep of each volume.
     auto chain = [&](const char *mask) {
         standin("powermgmt", mask);
         vol_lun_info_t *head = nullptr;
-        std::vector<std::string> v;
-        v.push_back(std::to_string(quiet([&] { return init_root_vol_lun_info(&head, 1); })));
+        std::string v = std::to_string(quiet([&] { return init_root_vol_lun_info(&head, 1); }));
         for (vol_lun_info_t *r = head; r; r = r->next)
-            v.push_back(std::string(r->uuid) + " " + r->vol_mnt_path + " " + std::to_string(r->hibernation));
+            v += std::string(";") + r->uuid + " " + r->vol_mnt_path + " " + std::to_string(r->hibernation);
         quiet([&] { vol_lun_info_list_deinit(&head); return 0; });
         return v;
     };
     // sdc, md2's only member, sleeps.
-    EXPECT_EQ(chain("result: 4"), std::vector<std::string>({"0", "u-ext4 " + ext4_ + " 0", "u-tmpfs " + tmpfs_ + " 1",
-                                                            "u-dup " + ext4_ + " 0", "u-dup2 " + tmpfs_ + " 1"}));
+    EXPECT_EQ(chain("result: 4"), subst("0;u-ext4 @EXT4@ 0;u-tmpfs @TMPFS@ 1;u-dup @EXT4@ 0;u-dup2 @TMPFS@ 1"));
     // Every disk asleep: every volume sleeps and no member list is read;
     // with one awake, the missing lists fail the walk.
     ASSERT_EQ(xmldbc_del(XMLDB_SOCK_SYSINFO, 0, "/raids"), 0);
-    EXPECT_EQ(chain("result: 7"), std::vector<std::string>({"0", "u-ext4 " + ext4_ + " 1", "u-tmpfs " + tmpfs_ + " 1",
-                                                            "u-dup " + ext4_ + " 1", "u-dup2 " + tmpfs_ + " 1"}));
-    EXPECT_EQ(chain("result: 3"), std::vector<std::string>({std::to_string(ERR_SYSINFO)}));
+    EXPECT_EQ(chain("result: 7"), subst("0;u-ext4 @EXT4@ 1;u-tmpfs @TMPFS@ 1;u-dup @EXT4@ 1;u-dup2 @TMPFS@ 1"));
+    EXPECT_EQ(chain("result: 3"), std::to_string(ERR_SYSINFO));
 }
 
 TEST_F(RealMounts, HostileMountPathRunsNothing)
