@@ -48,14 +48,10 @@ bool settled(size_t count)
     return eventually([&] { return running_daemons().size() == count; }, 10s);
 }
 
-// The stored iSNS enable flag and server.
-std::pair<int, std::string> stored()
+// The stored iSNS enable flag and server: "<flag> <server>".
+std::string stored()
 {
-    int enable = -1;
-    char ip[256] = {};
-    xmldb_get_nesrad_enable(&enable);
-    xmldb_get_nesrad_ip(ip, sizeof(ip));
-    return {enable, ip};
+    return xmldb_get("/system_mgr/iscsi/iSNS/enable") + " " + xmldb_get("/system_mgr/iscsi/iSNS/ip");
 }
 
 class NesradControl : public SysRootTest {
@@ -92,7 +88,7 @@ TEST_F(NesradControl, SettingStartsRestartsAndStopsOnlyWhenTheServiceRuns)
     // Service disabled: only stored, nothing started.
     xmldb_set_service_enable(0);
     EXPECT_EQ(0, isns_set_setting(1, "first.example", 0));
-    EXPECT_EQ(stored(), std::pair(1, std::string("first.example")));
+    EXPECT_EQ(stored(), "1 first.example");
     EXPECT_TRUE(running_daemons().empty());
     EXPECT_EQ(ERR_PARAM, isns_set_setting(2, "first.example", 0));
 
@@ -109,7 +105,7 @@ TEST_F(NesradControl, SettingStartsRestartsAndStopsOnlyWhenTheServiceRuns)
     // Same server (stored one used): the running daemon is left alone.
     EXPECT_EQ(0, isns_set_setting(1, "ignored", 1));
     EXPECT_EQ(std::vector<pid_t>{first}, running_daemons());
-    EXPECT_EQ(stored(), std::pair(1, hostile));
+    EXPECT_EQ(stored(), "1 " + hostile);
 
     // Another server: stopped by name, then a new daemon.
     EXPECT_EQ(0, isns_set_setting(1, "second.example", 0));
@@ -123,7 +119,7 @@ TEST_F(NesradControl, SettingStartsRestartsAndStopsOnlyWhenTheServiceRuns)
     // Off with the service disabled: stored only; with it enabled: stopped.
     xmldb_set_service_enable(0);
     EXPECT_EQ(0, isns_set_setting(0, nullptr, 0));
-    EXPECT_EQ(stored(), std::pair(0, std::string("second.example")));
+    EXPECT_EQ(stored(), "0 second.example");
     EXPECT_EQ(1u, running_daemons().size());
     xmldb_set_service_enable(1);
     EXPECT_EQ(0, isns_set_setting(0, nullptr, 0));
@@ -149,7 +145,7 @@ TEST_F(NesradControl, NotifyReachesTheRealDaemonAndResetClearsTheSettings)
     notify_isnsclient(SIGTERM);
     EXPECT_TRUE(settled(0));
     EXPECT_EQ(0, isns_factory_reset());
-    EXPECT_EQ(stored(), std::pair(0, std::string()));
+    EXPECT_EQ(stored(), " ");
 }
 
 }  // namespace

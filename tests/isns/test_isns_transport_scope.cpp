@@ -37,7 +37,7 @@ int why(int rc, const std::string &reason)
 // In the child: the interfaces (dummy where the kernel has it, else ifb:
 // both drop what they send), a server on fe80::1 held by `holder` (none: ""),
 // a global server's network on the first interface, then the connect to
-// `server`; 0 when it went through holder (none: failed) in time.
+// `server`; 0 when it connected (none: failed) in time.
 int scope_case(const std::vector<std::string> &ifaces, const std::string &holder, const char *server, double min_s)
 {
     const int family = std::strchr(server, ':') ? AF_INET6 : AF_INET;
@@ -68,15 +68,10 @@ int scope_case(const std::vector<std::string> &ifaces, const std::string &holder
     const auto [rc, s] = isns_test::timed([&] { return isns_connect(&fd, family, server, 3205); });
     if (s < min_s || s > min_s + 0.9)
         return why(1, "took " + std::to_string(s) + " s, expected " + std::to_string(min_s) + " to 0.9 s more");
-    if (holder.empty())
-        return rc == -1 ? 0 : why(1, "connected, expected failure");
-    sockaddr_in6 peer{};
-    socklen_t len = sizeof peer;
-    char name[IF_NAMESIZE] = "?";
-    if (rc != 0 || getpeername(fd, reinterpret_cast<sockaddr *>(&peer), &len) != 0)
-        return why(1, "no connection (rc " + std::to_string(rc) + ")");
-    if_indextoname(peer.sin6_scope_id, name);
-    return name == holder ? 0 : why(1, std::string("connected through ") + name + ", expected " + holder);
+    // Only the holder's scope can connect, so the time says which scopes came first.
+    if (rc != (holder.empty() ? -1 : 0))
+        return why(1, "connect answered " + std::to_string(rc));
+    return 0;
 }
 
 }  // namespace
