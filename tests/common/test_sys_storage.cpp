@@ -203,7 +203,8 @@ TEST_F(RealMounts, MountPathAndLockStateByUuid)
         const char *id = uuid == "\"\"" ? "" : uuid.c_str();  // clang 14 cannot capture a structured binding
         const int found = quiet([&] { return sys_raid_get_mnt_path_by_uuid(out, sizeof out, id); });
         const int unlocked = quiet([&] { return sys_raid_vol_is_unlocked_by_uuid(id); });
-        EXPECT_EQ(std::to_string(found) + " " + (*out ? out : "-") + " " + std::to_string(unlocked), subst(want)) << uuid;
+        EXPECT_EQ(std::to_string(found) + " " + (*out ? out : "-") + " " + std::to_string(unlocked), subst(want))
+            << uuid;
     }
     char small[8];
     EXPECT_EQ(quiet([&] { return sys_raid_get_mnt_path_by_uuid(small, sizeof small, "u-ext4"); }), 6);

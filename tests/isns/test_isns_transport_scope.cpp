@@ -43,7 +43,8 @@ int scope_case(const std::vector<std::string> &ifaces, const std::string &holder
     const int family = std::strchr(server, ':') ? AF_INET6 : AF_INET;
     std::string setup = "ip link set lo up", routes = "true";
     for (const std::string &i : ifaces) {
-        setup += " && { ip link add " + i + " type dummy || ip link add " + i + " type ifb; } && ip link set " + i + " up";
+        setup += " && { ip link add " + i + " type dummy || ip link add " + i + " type ifb; }";
+        setup += " && ip link set " + i + " up";
         routes += " && ip -6 route show dev " + i + " | grep -q '^fe80::/64'";
     }
     if (!holder.empty()) {
