@@ -2,6 +2,7 @@
 // The appliance in a test root, the daemon as a real process, isnsadm's view.
 #include "tests/daemon/daemon_harness.h"
 
+#include <sys/syscall.h>
 #include <unistd.h>
 
 #include <cstdlib>
@@ -115,6 +116,15 @@ int daemon_process::count(const std::string &text) const
 bool daemon_process::wait_for(const std::string &text, std::chrono::milliseconds limit, int n) const
 {
     return eventually([&] { return count(text) >= n; }, limit);
+}
+
+bool daemon_process::idle() const
+{
+    // "<number> <arguments...>" while blocked in a system call, "running" otherwise.
+    std::ifstream in("/proc/" + std::to_string(pid()) + "/syscall");
+    long nr = -1;
+    std::string fds, nfds;
+    return in >> nr >> fds >> nfds && nr == SYS_ppoll && nfds == "0x0";
 }
 
 }  // namespace korv_test

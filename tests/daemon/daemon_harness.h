@@ -61,8 +61,6 @@ public:
     // Runs `binary server` with stdout and stderr in a file; env as ours.
     daemon_process(const std::string &binary, const std::string &server);
     ~daemon_process();  // SIGKILLs a daemon still running
-    daemon_process(const daemon_process &) = delete;
-    daemon_process &operator=(const daemon_process &) = delete;
 
     pid_t pid() const { return proc_.pid(); }
     void signal(int sig) const { proc_.signal(sig); }
@@ -75,6 +73,9 @@ public:
     int count(const std::string &text) const;
     // Waits until the output holds `text` at least n times.
     bool wait_for(const std::string &text, std::chrono::milliseconds limit, int n = 1) const;
+    // True while it sleeps between passes (its wait: ppoll on no descriptor),
+    // not in an exchange, a start-up step or a lock wait.
+    bool idle() const;
 
 private:
     child_process proc_;

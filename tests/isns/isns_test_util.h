@@ -54,8 +54,7 @@ inline isns_iscsi_node *make_node(const char *name, uint32_t tag, const std::vec
 
 inline bytes status_rsp(uint32_t status, uint16_t func = 0x8002)
 {
-    const bytes tlv = isns_attr_u32(0, status);  // tag and length, then the status
-    return isns_pdu(func, 0x4c00, bytes(tlv.begin() + 8, tlv.end()));
+    return isns_pdu(func, 0x4c00, be32(status));
 }
 
 // A scripted server on address answering every connection with reply, and

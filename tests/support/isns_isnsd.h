@@ -35,8 +35,6 @@ public:
     // expires (0: never). Nothing starts yet.
     explicit isnsd_server(std::string address, int registration_period = 0);
     ~isnsd_server();
-    isnsd_server(const isnsd_server &) = delete;
-    isnsd_server &operator=(const isnsd_server &) = delete;
 
     // Starts isnsd and waits (up to 5 s) until it accepts connections.
     // false, with error(), when it cannot start or the port is already held.

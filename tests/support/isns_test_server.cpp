@@ -29,12 +29,6 @@ socklen_t make_addr(const std::string &address, int port, sockaddr_storage *ss)
     return len;
 }
 
-bytes be32(uint32_t v)
-{
-    return {static_cast<uint8_t>(v >> 24), static_cast<uint8_t>(v >> 16), static_cast<uint8_t>(v >> 8),
-            static_cast<uint8_t>(v)};
-}
-
 }  // namespace
 
 isns_fake_server::isns_fake_server(const std::string &address, int port)
@@ -44,12 +38,9 @@ isns_fake_server::isns_fake_server(const std::string &address, int port)
     const int fd = len ? socket(ss.ss_family, SOCK_STREAM | SOCK_CLOEXEC, 0) : -1;
     int one = 1;
     setsockopt(fd, SOL_SOCKET, SO_REUSEADDR, &one, sizeof one);
-    if (ss.ss_family == AF_INET6)
-        setsockopt(fd, IPPROTO_IPV6, IPV6_V6ONLY, &one, sizeof one);
     if (fd < 0 || bind(fd, reinterpret_cast<sockaddr *>(&ss), len) != 0 || listen(fd, 8) != 0) {
         error_ = "cannot listen on " + address + ":" + std::to_string(port) + ": " + std::strerror(errno);
-        if (fd >= 0)
-            close(fd);
+        close(fd);
         return;
     }
     listen_fd_ = fd;
@@ -129,18 +120,17 @@ void isns_fake_server::serve_one(int fd)
     wait_readable(-1, reply.hold_ms);
 }
 
-// Sized once and filled in place: growing vectors here trips GCC 12's
-// -Warray-bounds false positive at -O3.
+bytes be32(uint32_t v)
+{
+    return {static_cast<uint8_t>(v >> 24), static_cast<uint8_t>(v >> 16), static_cast<uint8_t>(v >> 8),
+            static_cast<uint8_t>(v)};
+}
+
+// Version 1 and the function id, then the length and the flags, then the
+// transaction and sequence ids (0).
 bytes isns_pdu(uint16_t func, uint16_t flags, const bytes &payload)
 {
-    bytes b(12 + payload.size(), 0);
-    const uint16_t fields[] = {1, func, static_cast<uint16_t>(payload.size()), flags};
-    for (int i = 0; i < 4; i++) {
-        b[2 * i] = static_cast<uint8_t>(fields[i] >> 8);
-        b[2 * i + 1] = static_cast<uint8_t>(fields[i]);
-    }
-    std::copy(payload.begin(), payload.end(), b.begin() + 12);
-    return b;
+    return be32(1u << 16 | func) + be32(static_cast<uint32_t>(payload.size()) << 16 | flags) + be32(0) + payload;
 }
 
 bytes isns_attr_raw(uint32_t tag, const bytes &value)
@@ -155,11 +145,6 @@ bytes isns_attr_str(uint32_t tag, const std::string &text)
     return isns_attr_raw(tag, v);
 }
 
-bytes isns_attr_u32(uint32_t tag, uint32_t value)
-{
-    return isns_attr_raw(tag, be32(value));
-}
-
 bytes isns_query_rsp(uint32_t status, const std::string &key, const std::vector<std::string> &names)
 {
     bytes b = be32(status) + isns_attr_str(32, key) + isns_attr_raw(0, {});
@@ -168,6 +153,8 @@ bytes isns_query_rsp(uint32_t status, const std::string &key, const std::vector<
     return b;
 }
 
+// Sized once and filled in place: growing vectors here trips GCC 12's
+// -Warray-bounds false positive at -O3.
 bytes operator+(bytes a, const bytes &b)
 {
     bytes r(a.size() + b.size());

@@ -10,7 +10,8 @@
 // promptly even in the middle of a reply.
 //
 // The builders below make the response bytes: isns_pdu() a PDU with header,
-// isns_attr_*() one TLV, isns_query_rsp() a DevAttrQryRsp payload.
+// isns_attr_*() one TLV, isns_query_rsp() a DevAttrQryRsp payload, be32() a
+// 32-bit value (a status).
 #pragma once
 
 #include <atomic>
@@ -37,8 +38,6 @@ public:
     // Binds address:port; check ok() (error() says why not).
     explicit isns_fake_server(const std::string &address, int port = 3205);
     ~isns_fake_server();
-    isns_fake_server(const isns_fake_server &) = delete;
-    isns_fake_server &operator=(const isns_fake_server &) = delete;
 
     bool ok() const { return listen_fd_ >= 0; }
     const std::string &error() const { return error_; }
@@ -72,9 +71,10 @@ private:
 
 // A PDU: version 1, function id, payload length, flags, ids 0, then payload.
 bytes isns_pdu(uint16_t func, uint16_t flags, const bytes &payload);
-// TLVs: a string padded with NULs to a multiple of 4, a 32-bit value, raw bytes.
+// A 32-bit value, big-endian.
+bytes be32(uint32_t value);
+// TLVs: a string padded with NULs to a multiple of 4, raw bytes.
 bytes isns_attr_str(uint32_t tag, const std::string &text);
-bytes isns_attr_u32(uint32_t tag, uint32_t value);
 bytes isns_attr_raw(uint32_t tag, const bytes &value);
 // Payload of a DevAttrQryRsp: status, the echoed key (node name), delimiter,
 // then one iSCSI Name attribute per held name.

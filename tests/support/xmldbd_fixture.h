@@ -34,8 +34,6 @@ public:
     {
     }
     ~XmldbProcess();
-    XmldbProcess(const XmldbProcess &) = delete;
-    XmldbProcess &operator=(const XmldbProcess &) = delete;
 
     // Starts the service (no-op when running); returns when it is serving.
     // Throws std::runtime_error when it does not come up within 10 s.
