@@ -22,10 +22,7 @@ namespace {
 constexpr const char *kConfigfsIscsi = "/sys/kernel/config/target/iscsi";
 }  // namespace
 
-void set_host_name(const std::string &name)
-{
-    SysRoot::write("/proc/sys/kernel/hostname", name + "\n");
-}
+void set_host_name(const std::string &name) { SysRoot::write("/proc/sys/kernel/hostname", name + "\n"); }
 
 void store_targets(const std::string &entity_id, const std::vector<target_spec> &targets)
 {
@@ -66,18 +63,14 @@ std::string nesrad_test_binary() { return NESRAD_TEST_BIN; }
 
 std::set<std::string> isnsadm_rows(const isnsd_server &srv, const std::string &what, const std::string &key)
 {
-    // isnsadm prints one "<tag and type>: <name> = <value>" line per attribute.
+    // isnsadm prints one "<tag and type>: <name> = <value>" line per
+    // attribute; the string values read here are quoted.
     std::set<std::string> values;
     std::istringstream in(srv.adm("--list " + what));
-    for (std::string line; std::getline(in, line);) {
-        const size_t colon = line.find(": "), eq = line.find(" = ", colon);
-        if (eq == std::string::npos || line.compare(colon + 2, eq - colon - 2, key) != 0)
-            continue;
-        std::string value = line.substr(eq + 3);
-        if (value.size() >= 2 && value.front() == '"' && value.back() == '"')
-            value = value.substr(1, value.size() - 2);
-        values.insert(value);
-    }
+    const std::string marker = ": " + key + " = \"";
+    for (std::string line; std::getline(in, line);)
+        if (const size_t at = line.find(marker); at != std::string::npos && line.back() == '"')
+            values.insert(line.substr(at + marker.size(), line.size() - at - marker.size() - 1));
     return values;
 }
 

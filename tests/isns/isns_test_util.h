@@ -62,7 +62,6 @@ inline bytes status_rsp(uint32_t status, uint16_t func = 0x8002)
 inline std::unique_ptr<isns_fake_server> fake_at(const char *address, isns_fake_reply reply, const char *source = "")
 {
     auto srv = std::make_unique<isns_fake_server>(address);
-    EXPECT_TRUE(srv->ok()) << srv->error();
     srv->set_reply(std::move(reply));
     reset_client(address, AF_INET, source);
     return srv;

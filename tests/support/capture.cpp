@@ -1,9 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
+// GoogleTest's own capture: it flushes every stream and redirects the
+// descriptor, so printf, iostreams and write(2) all land in the text.
 #include "tests/support/capture.h"
-
-#include <unistd.h>
-
-#include <cstdio>
 
 #include <gtest/gtest.h>
 
@@ -11,32 +9,19 @@
 
 namespace korv_test {
 
-namespace {
-std::string capture(std::FILE *stream, const std::function<void()> &fn)
+std::string capture_stdout(const std::function<void()> &fn)
 {
-    std::fflush(stream);
-    std::FILE *tmp = std::tmpfile();
-    if (!tmp) {
-        ADD_FAILURE() << "tmpfile failed";
-        return {};
-    }
-    const int fd = fileno(stream), saved = dup(fd);
-    dup2(fileno(tmp), fd);
+    testing::internal::CaptureStdout();
     fn();
-    std::fflush(stream);
-    dup2(saved, fd);
-    close(saved);
-    std::fseek(tmp, 0, SEEK_END);
-    std::string out(static_cast<size_t>(std::ftell(tmp)), '\0');
-    std::rewind(tmp);
-    out.resize(std::fread(out.data(), 1, out.size(), tmp));
-    std::fclose(tmp);
-    return out;
+    return testing::internal::GetCapturedStdout();
 }
-}  // namespace
 
-std::string capture_stdout(const std::function<void()> &fn) { return capture(stdout, fn); }
-std::string capture_stderr(const std::function<void()> &fn) { return capture(stderr, fn); }
+std::string capture_stderr(const std::function<void()> &fn)
+{
+    testing::internal::CaptureStderr();
+    fn();
+    return testing::internal::GetCapturedStderr();
+}
 
 int run_in_child(const std::function<int()> &fn)
 {

@@ -2,7 +2,6 @@
 #include "tests/support/isns_test_server.h"
 
 #include <netdb.h>
-#include <netinet/in.h>
 #include <poll.h>
 #include <sys/socket.h>
 #include <unistd.h>
@@ -10,6 +9,8 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstring>
+
+#include <gtest/gtest.h>
 
 namespace korv_test {
 
@@ -39,7 +40,7 @@ isns_fake_server::isns_fake_server(const std::string &address, int port)
     int one = 1;
     setsockopt(fd, SOL_SOCKET, SO_REUSEADDR, &one, sizeof one);
     if (fd < 0 || bind(fd, reinterpret_cast<sockaddr *>(&ss), len) != 0 || listen(fd, 8) != 0) {
-        error_ = "cannot listen on " + address + ":" + std::to_string(port) + ": " + std::strerror(errno);
+        ADD_FAILURE() << "cannot listen on " << address << ":" << port << ": " << std::strerror(errno);
         close(fd);
         return;
     }
@@ -52,8 +53,7 @@ isns_fake_server::~isns_fake_server()
     stop_ = true;
     if (thread_.joinable())
         thread_.join();
-    if (listen_fd_ >= 0)
-        close(listen_fd_);
+    close(listen_fd_);
 }
 
 void isns_fake_server::set_handler(std::function<isns_fake_reply(const bytes &)> handler)

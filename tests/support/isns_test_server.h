@@ -35,12 +35,9 @@ struct isns_fake_reply {
 
 class isns_fake_server {
 public:
-    // Binds address:port; check ok() (error() says why not).
+    // Binds address:port; a test failure says why it cannot.
     explicit isns_fake_server(const std::string &address, int port = 3205);
     ~isns_fake_server();
-
-    bool ok() const { return listen_fd_ >= 0; }
-    const std::string &error() const { return error_; }
 
     // Every connection gets this reply (default: none, close at once).
     void set_reply(isns_fake_reply reply)
@@ -62,7 +59,6 @@ private:
 
     int listen_fd_ = -1;
     std::atomic<bool> stop_{false};
-    std::string error_;
     mutable std::mutex mu_;
     std::function<isns_fake_reply(const bytes &)> handler_;
     std::vector<bytes> requests_;
