@@ -5,6 +5,7 @@
 #pragma once
 
 #include <cstdio>
+#include <fstream>
 #include <functional>
 #include <memory>
 #include <string>
@@ -15,6 +16,7 @@
 #include "common/korvadm_err.h"
 #include "common/korvadm_list.h"
 #include "common/korvadm_log.h"
+#include "common/korvadm_str.h"
 #include "config/korvadm_conf.h"
 #include "config/korvadm_xmldb_conf.h"
 #include "config/korvadm_xmldb_conf_internal.h"
@@ -26,6 +28,30 @@ namespace korv_test {
 
 // A sample database tree under tests/config/data.
 inline std::string data_file(const char *name) { return std::string(KORV_CONFIG_DATA) + "/" + name; }
+
+// A data file's lines without comments.
+inline std::string data(const char *name)
+{
+    std::ifstream in(data_file(name));
+    std::string out;
+    for (std::string l; std::getline(in, l);)
+        if (!l.empty() && l[0] != '#')
+            out += l + "\n";
+    return out;
+}
+
+// The "path = value" lines of the subtree at path, in the store's order, of
+// the service on sock (a system path).
+inline std::string dump(const std::string &path, const std::string &sock = XMLDB_SOCK_ISCSI)
+{
+    std::string out;
+    korv::read_command_lines((xmldbc_binary() + " -s " + sock + " dump " + path).c_str(), [&](std::string_view l) {
+        if (l.find(" = ") != std::string_view::npos)
+            out.append(l).append("\n");
+        return true;
+    });
+    return out;
+}
 
 // "<root>/id:<n>/<field>"
 inline std::string epath(const std::string &root, int n, const std::string &field)

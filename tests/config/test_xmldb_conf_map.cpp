@@ -61,20 +61,7 @@ private:
     child_process proc_;  // stopped with the proxy
 };
 
-class Mapping : public SampleStore {
-protected:
-    // The target's map as "lun_name:lun_num ...", with its count.
-    static std::string map_of(int t)
-    {
-        std::string out;
-        const std::string map = tpath(t, "map_lun");
-        for (int m = 1; !raw(epath(map, m, "lun_name")).empty(); m++)
-            out += raw(epath(map, m, "lun_name")) + ":" + raw(epath(map, m, "lun_num")) + " ";
-        return out + "#" + raw(tpath(t, "map_lun/count"));
-    }
-    // The LUN's own record of its mapping.
-    static std::string lun_side(int l) { return raw(lpath(l, "target_name")) + ":" + raw(lpath(l, "lun_num")); }
-};
+using Mapping = SampleStore;
 
 }  // namespace
 
@@ -83,7 +70,7 @@ TEST_F(Mapping, BothSidesAgreeThroughMapAndUnmap)
     EXPECT_EQ(iscsi_conf_ops.xmldb_add_target_lun_map("t1", "l1", 0), KORV_OK);
     EXPECT_EQ(xmldb_add_target_lun_map("t1", "l2", 1), KORV_OK);
     EXPECT_EQ(xmldb_add_target_lun_map("t1", "l3", 5), KORV_OK);
-    EXPECT_EQ(map_of(1) + " " + lun_side(1) + " " + lun_side(3), "l1:0 l2:1 l3:5 #3 t1:0 t1:5");
+    EXPECT_EQ(dump("/iscsi"), data("map_three.txt"));
     EXPECT_EQ(records<target_map_lun_conf_t>([](list_t *l) { return xmldb_get_target_map_lun_conf("t1", l); },
                                              target_map_lun_conf_free_list),
               "t1/l1/0 t1/l2/1 t1/l3/5");
@@ -96,7 +83,7 @@ TEST_F(Mapping, BothSidesAgreeThroughMapAndUnmap)
 
     // Unmapping the first keeps the later ones visible to every map reader.
     EXPECT_EQ(xmldb_del_target_lun_map("t1", "l1"), KORV_OK);
-    EXPECT_EQ(map_of(1) + " " + lun_side(1), "l3:5 l2:1 #2 :0");
+    EXPECT_EQ(dump("/iscsi"), data("map_first_unmapped.txt"));
     EXPECT_EQ(slash(xmldb_get_free_lun_num(&num, "t1"), num), "0/0");
     EXPECT_EQ(quiet([] { return xmldb_del_target_lun_map("t1", "l1"); }), ERR_NOT_FOUND);
 }
@@ -112,18 +99,19 @@ TEST_F(Mapping, RefusesUnknownOrEmptyNamesAndAFullMap)
         {ERR_NOT_FOUND, "t9", "l1", "can not find t9 in xmldb target entry"},
         {ERR_NOT_FOUND, "t1", "l9", "can not find l9 in xmldb lun entry"},
     };
+    const std::string before = dump("/iscsi");
     g_korv_debug_level = 2;
     for (const auto &c : cases)
         EXPECT_EQ(logged([&] { return xmldb_add_target_lun_map(c.target, c.lun, 0); }, c.message), c.rc);
     g_korv_debug_level = 0;
-    EXPECT_EQ(map_of(1) + lun_side(1), "#:");
+    EXPECT_EQ(dump("/iscsi"), before);
 
     for (int m = 1; m <= 128; m++)
         put(epath(tpath(2, "map_lun"), m, "lun_name"), "x");
     EXPECT_EQ(logged([] { return xmldb_add_target_lun_map("t2", "l1", 0); },
                      "the Maximum number of target lun has reached"),
               ERR_NO_ROOM);
-    EXPECT_EQ(lun_side(1), ":");
+    EXPECT_EQ(raw(lpath(1, "target_name")) + raw(lpath(1, "lun_num")), "");
 }
 
 TEST_F(Mapping, AFailedWriteTakesBackTheNewMapEntryAndTheLunsTargetName)
@@ -133,21 +121,16 @@ TEST_F(Mapping, AFailedWriteTakesBackTheNewMapEntryAndTheLunsTargetName)
     db().stop();
     const char *real_sock = "/var/run/xmldb_real";
     XmldbProcess real(SysRoot::file(real_sock), {"--load", data_file("mapped_one.xml")});
-    auto at = [&](const std::string &path) {
-        char buf[256] = "";
-        EXPECT_GE(xmldbc_get_wb(real_sock, 0, path.c_str(), buf, sizeof buf), 0) << path;
-        return std::string(buf);
-    };
     const struct {
         int refuse;
         const char *message;
-        const char *lun_num_left;
+        const char *left;  // what the real service holds afterwards
     } rows[] = {
-        {1, "set /iscsi/target/id:1/map_lun/id:2/lun_name = l1 failed", ""},
-        {2, "set /iscsi/target/id:1/map_lun/id:2/lun_num = 7 failed", ""},
-        {3, "set /iscsi/lun/id:1/target_name = t1 failed", ""},
-        {4, "set /iscsi/lun/id:1/lun_num = 7 failed", ""},
-        {5, "set LUN count = 2 failed", "7"},
+        {1, "set /iscsi/target/id:1/map_lun/id:2/lun_name = l1 failed", "map_rolled_back.txt"},
+        {2, "set /iscsi/target/id:1/map_lun/id:2/lun_num = 7 failed", "map_rolled_back.txt"},
+        {3, "set /iscsi/lun/id:1/target_name = t1 failed", "map_rolled_back.txt"},
+        {4, "set /iscsi/lun/id:1/lun_num = 7 failed", "map_rolled_back.txt"},
+        {5, "set LUN count = 2 failed", "map_rolled_back_count.txt"},
     };
     for (const auto &r : rows) {
         real.stop();
@@ -157,11 +140,7 @@ TEST_F(Mapping, AFailedWriteTakesBackTheNewMapEntryAndTheLunsTargetName)
             EXPECT_EQ(logged([] { return xmldb_add_target_lun_map("t1", "l1", 7); }, r.message), ERR_DB_WRITE);
         }
         // Entry 1 and the LUN it maps stay; entry 2 and l1's target name go.
-        const std::string map = "/iscsi/target/id:1/map_lun/";
-        EXPECT_EQ(at(map + "id:1/lun_name") + ":" + at(map + "id:1/lun_num") + " " + at(map + "id:2/lun_name") +
-                      at(map + "id:2/lun_num") + " #" + at(map + "count") + " " + at(lpath(2, "target_name")) + " " +
-                      at(lpath(1, "target_name")) + "/" + at(lpath(1, "lun_num")),
-                  std::string("l2:0  #1 t1 /") + r.lun_num_left)
+        EXPECT_EQ(dump("/iscsi", real_sock), data(r.left))
             << r.refuse;
     }
 }

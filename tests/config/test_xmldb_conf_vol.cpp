@@ -1,43 +1,18 @@
 // SPDX-License-Identifier: Apache-2.0
 // The per-volume summaries under "/iscsi/lun/total_size": lookup by UUID and
 // the rewrite from a volume list, checked against whole dumps of the store.
-#include <fstream>
 #include <sstream>
 
-#include "common/korvadm_str.h"
 #include "common/korvadm_sys.h"
 #include "tests/config/store_fixture.h"
 
-using korv_test::quiet;
+using namespace korv_test;
 
 namespace {
 
-// A data file's lines without comments.
-std::string data(const std::string &name)
-{
-    std::ifstream in(korv_test::data_file(name.c_str()));
-    std::string out;
-    for (std::string l; std::getline(in, l);)
-        if (!l.empty() && l[0] != '#')
-            out += l + "\n";
-    return out;
-}
-
-// The "path = value" lines of the store's subtree, in the store's order.
-std::string dump(const std::string &path)
-{
-    std::string out;
-    korv::read_command_lines((korv_test::xmldbc_binary() + " dump " + path).c_str(), [&](std::string_view l) {
-        if (l.find(" = ") != std::string_view::npos)
-            out.append(l).append("\n");
-        return true;
-    });
-    return out;
-}
-
 constexpr char kBefore[] = "vol_summaries_before.xml";
 
-class VolSummaries : public korv_test::LoadedStore<kBefore> {
+class VolSummaries : public LoadedStore<kBefore> {
 protected:
     void SetUp() override
     {
