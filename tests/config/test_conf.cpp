@@ -53,7 +53,7 @@ TEST_F(ConfContext, GeneratedIqnIsPrefixThenFirstColonSecondCutToTheBuffer)
     EXPECT_EQ(quiet([&] { return iscsi_conf_generate_iqn(out, nullptr, "t1"); }), ERR_PARAM);
 
     std::memset(out, 'Z', sizeof out);
-    EXPECT_EQ(iscsi_conf_generate_iqn(out, "nas", std::string(300, 'n').c_str()), 328);
+    EXPECT_EQ(iscsi_conf_generate_iqn(out, "nas", std::string(300, 'n').c_str()), 304);
     EXPECT_EQ(std::strlen(out), static_cast<size_t>(CONF_GEN_IQN_LEN - 1));
     EXPECT_EQ(out[CONF_GEN_IQN_LEN], 'Z');
 }

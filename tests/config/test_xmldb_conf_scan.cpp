@@ -66,15 +66,12 @@ const KeyedList kLists[] = {
 
 }  // namespace
 
-using Lists = StoreTest;
+constexpr char kFullLists[] = "full_lists.xml";
+using FullLists = LoadedStore<kFullLists>;
 
-TEST_F(Lists, AFullListRefusesTheNextEntryAndHasNoFreeNumber)
+TEST_F(FullLists, RefuseTheNextEntryAndHaveNoFreeNumber)
 {
     for (const KeyedList &l : kLists) {
-        for (int n = 1; n <= l.capacity; n++) {
-            put(epath(l.root, n, "name"), "e" + std::to_string(n));
-            put(epath(l.root, n, l.number), std::to_string(n - 1));
-        }
         const std::string next = "e" + std::to_string(l.capacity + 1);
         EXPECT_EQ(logged([&] { return l.add(next.c_str()); }, l.full_message), ERR_NO_ROOM) << l.root;
         EXPECT_EQ(raw(epath(l.root, l.capacity + 1, "name")) + raw(std::string(l.root) + "/count"), "");
@@ -111,6 +108,8 @@ TEST_F(Ghosts, DeleteLeavesAGapAndTheRecountRemovesOnlyANamelessGhostAtCountPlus
     }
     EXPECT_EQ(dump("/iscsi"), data("ghosts_deleted.txt"));
 }
+
+using Lists = StoreTest;
 
 TEST_F(Lists, OnlyADeadServiceFailsAWholeReadAndNothingIsHandedOut)
 {
