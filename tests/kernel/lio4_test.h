@@ -3,18 +3,23 @@
 // that sample configfs trees (tests/kernel/data/*.tree) are loaded into, and
 // the records the operations take: target iqn.2026-01.test:t1 portal group 1,
 // LUN disk1 on a file, its mapping as LUN 3 and initiator i1's right to it.
+// Every test file of the driver includes this header alone.
 #pragma once
 
 #include <unistd.h>
 
 #include <cstdio>
+#include <cstring>
 #include <filesystem>
 #include <fstream>
 #include <set>
 #include <sstream>
 #include <string>
 
-#include "kernel/korvadm_mod.h"
+#include "common/korvadm_err.h"
+#include "kernel/korvadm_mod_lio4_internal.h"
+#include "kernel/korvadm_sess.h"
+#include "tests/support/capture.h"
 #include "tests/support/sysroot.h"
 
 namespace korv_test {
@@ -26,6 +31,54 @@ inline std::string data_file(const std::string &name)
     text << std::ifstream(std::string(KORV_TEST_DATA) + "/" + name, std::ios::binary).rdbuf();
     return text.str();
 }
+
+// A session listing's caller: target iqn.2026-01.test:t1 portal group 1,
+// the session and initiator lists, all released at the end.
+struct Listing {
+    korv::list_owner sessions_{iscsi_sess_free_list}, initiators_{iscsi_initiator_free_list};
+    list_t &sessions = *sessions_.get(), &initiators = *initiators_.get();
+    std::unique_ptr<iscsi_target_t, decltype(&iscsi_target_free)> target_{iscsi_target_new(), iscsi_target_free};
+    iscsi_target_t *target = target_.get();
+    Listing()
+    {
+        std::strcpy(target->iqn, "iqn.2026-01.test:t1");
+        target->tpgt = 1;
+    }
+
+    // The text in a heap block of exactly its size, so that any read past
+    // it is caught under the sanitizers.
+    int parse(const std::string &text)
+    {
+        std::unique_ptr<char[]> buf(new char[text.size() + 1]);
+        std::memcpy(buf.get(), text.data(), text.size());
+        return _lio3_parse_sessions(&sessions, &initiators, target, buf.get(), text.size());
+    }
+
+    // Sessions in list order with their connections, then the initiators.
+    std::string render() const
+    {
+        std::ostringstream out;
+        for (iscsi_sess_t *s : korv::list_records<iscsi_sess_t>(&sessions)) {
+            char isid[3 * ISCSI_ISID_LEN];
+            std::snprintf(isid, sizeof isid, "%02x %02x %02x %02x %02x %02x", s->isid[0], s->isid[1], s->isid[2],
+                          s->isid[3], s->isid[4], s->isid[5]);
+            bool to_target = s->target_node.list == &target->sess_list;
+            bool to_initiator = s->initiator && s->initiator_node.list == &s->initiator->sess_list;
+            out << "sess sid=" << s->sid << " tsih=" << s->tsih << " isid=" << isid
+                << " initiator=" << (s->initiator ? s->initiator->name : "-")
+                << (to_target && to_initiator ? " linked" : !s->target_node.list && !s->initiator_node.list ? " unlinked" : " half")
+                << "\n";
+            for (iscsi_conn_t *c : korv::list_records<iscsi_conn_t>(&s->conn_list))
+                out << "  conn cid=" << c->cid << " address=" << (c->address ? c->address : "-")
+                    << " name=" << (c->initiator_name ? c->initiator_name : "-")
+                    << (c->local_address ? " local!" : "") << "\n";
+        }
+        out << "initiators:";
+        for (iscsi_initiator_t *i : korv::list_records<iscsi_initiator_t>(&initiators))
+            out << " " << i->name;
+        return out.str() + "\n";
+    }
+};
 
 class Lio4Test : public SysRootTest {
 protected:
@@ -76,7 +129,7 @@ protected:
     }
     // Every path under the root with its kind, a file's text and a link's
     // target: what an operation that must touch nothing leaves equal.
-    static std::string snapshot()
+    static std::set<std::string> snapshot()
     {
         std::set<std::string> all;
         for (const auto &e : std::filesystem::recursive_directory_iterator(root())) {
@@ -84,10 +137,7 @@ protected:
                                : e.is_directory() ? "/" : " = " + read_file(e.path());
             all.insert(e.path().string() + what);
         }
-        std::string text;
-        for (const std::string &line : all)
-            text += line + "\n";
-        return text;
+        return all;
     }
     template <size_t N>
     static void set(char (&field)[N], const std::string &text)

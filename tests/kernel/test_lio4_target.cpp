@@ -2,12 +2,7 @@
 // Targets on plain files: the enable switch, and the teardown of a portal
 // group unlinking links without following them. The argument checks every
 // operation shares are in test_lio4_ops.cpp.
-#include <string>
-
-#include "common/korvadm_err.h"
-#include "kernel/korvadm_mod_lio4_internal.h"
 #include "tests/kernel/lio4_test.h"
-#include "tests/support/capture.h"
 
 namespace {
 

@@ -1,61 +1,20 @@
 // SPDX-License-Identifier: Apache-2.0
-// The driver table selection and the iscsi_mod_ wrappers.
-#include "kernel/korvadm_mod.h"
-
-#include <string>
-
-#include <gtest/gtest.h>
-
-#include "common/korvadm_err.h"
-#include "kernel/korvadm_mod_lio4.h"
+// The driver table selection, the iscsi_mod_ wrappers and the driver's
+// records. The VM suite calls the LIO table through every wrapper.
 #include "tests/kernel/lio4_test.h"
 
 namespace {
 
-// The last call that reached the recording table: slot and arguments.
-struct call {
-    int slot = -1;
-    const void *arg1 = nullptr, *arg2 = nullptr;
-    int number = 0;
-    bool operator==(const call &) const = default;
-} rec;
-
-iscsi_mod_ops_t recording_table()
-{
-    iscsi_mod_ops_t t{};
-    t.set_target_attr_dataout_timeout = [](int timeout, iscsi_target_t *target) {
-        rec = {9, target, nullptr, timeout};
-        return 19;
-    };
-    t.add_lun_mapping = [](iscsi_lun_t *lun, iscsi_target_t *target, int n) {
-        rec = {15, lun, target, n};
-        return 25;
-    };
-    t.get_target_session = [](list_t *sess, list_t *init, iscsi_target_t *) {
-        rec = {21, sess, init, 0};
-        return 31;
-    };
-    return t;
-}
-
 class ModTest : public korv_test::Lio4Test {
 protected:
-    void SetUp() override
-    {
-        Lio4Test::SetUp();
-        saved_ = iscsi_mod_ops;
-        rec = call{};
-        list_init(&list_);
-    }
     void TearDown() override
     {
         iscsi_mod_ops = saved_;
         Lio4Test::TearDown();
     }
-    const iscsi_mod_ops_t *saved_ = nullptr;
-    iscsi_target_t target_{};
-    iscsi_lun_t lun_{};
-    list_t list_;
+    const iscsi_mod_ops_t *saved_ = iscsi_mod_ops;
+    korv::list_owner ips_{iscsi_ip_free_list};
+    list_t &list_ = *ips_.get();
 };
 
 TEST_F(ModTest, SelectAcceptsOnlyTheLioTypeAndWithoutATableEachWrapperAnswersItsOwnCode)
@@ -67,39 +26,31 @@ TEST_F(ModTest, SelectAcceptsOnlyTheLioTypeAndWithoutATableEachWrapperAnswersIts
     EXPECT_EQ(iscsi_mod_start(), ERR_MODULE_START);
     EXPECT_EQ(iscsi_mod_stop(), ERR_MODULE_START);
     EXPECT_EQ(iscsi_mod_get_state(), 1);
-    EXPECT_EQ(iscsi_mod_add_target(&target_), ERR_PARAM);
-    EXPECT_EQ(iscsi_mod_get_target_ip_list(&list_, &target_), ERR_PARAM);
-    EXPECT_EQ(iscsi_mod_del_backstore(&lun_), ERR_MODULE_START);
-    EXPECT_EQ(iscsi_mod_get_target_ip_list_in_target_parm(&list_, "iqn.x", 1), ERR_PARAM);
-    // Every slot of the LIO table is called through it in test_lio4_ops.cpp.
+    EXPECT_EQ(iscsi_mod_add_target(&target), ERR_PARAM);
+    EXPECT_EQ(iscsi_mod_del_backstore(&lun), ERR_MODULE_START);
+    EXPECT_EQ(iscsi_mod_get_target_ip_list_in_target_parm(&list_, IQN, 1), ERR_PARAM);
     ASSERT_EQ(iscsi_mod_select(ISCSI_MOD_TYPE_LIO), 0);
     EXPECT_EQ(iscsi_mod_ops, &lio3_mod_ops);
 }
 
-TEST_F(ModTest, WrappersCheckArgumentsThenPassThemThrough)
+// An empty table tells where a call stopped: -9989 at the wrapper's check,
+// -9967 at the slot.
+TEST_F(ModTest, WrappersCheckArgumentsBeforeTheTable)
 {
-    iscsi_mod_ops_t table = recording_table();
+    iscsi_mod_ops_t table{};
     iscsi_mod_ops = &table;
-    iscsi_map_lun_t map{};
-    iscsi_lun_acl_t acl{};
-    acl.map_lun = &map;  // initiator still missing
+    iscsi_map_lun_t no_map{};
+    iscsi_lun_acl_t no_initiator{&no_map, nullptr, 1, {}};
     EXPECT_EQ(iscsi_mod_add_target(nullptr), ERR_PARAM);
-    EXPECT_EQ(iscsi_mod_set_dataout_timeout(-1, &target_), ERR_PARAM);
-    EXPECT_EQ(iscsi_mod_get_target_ip_list(nullptr, &target_), ERR_PARAM);
-    EXPECT_EQ(iscsi_mod_add_lun_mapping(&lun_, &target_, -1), ERR_PARAM);
+    EXPECT_EQ(iscsi_mod_set_dataout_timeout(-1, &target), ERR_PARAM);
+    EXPECT_EQ(iscsi_mod_get_target_ip_list(nullptr, &target), ERR_PARAM);
+    EXPECT_EQ(iscsi_mod_add_lun_mapping(&lun, &target, -1), ERR_PARAM);
     EXPECT_EQ(iscsi_mod_del_backstore(nullptr), ERR_PARAM);
-    EXPECT_EQ(iscsi_mod_add_lun_acl(&acl), ERR_PARAM);
-    EXPECT_EQ(iscsi_mod_get_target_session(&list_, nullptr, &target_), ERR_PARAM);
-    EXPECT_EQ(rec, call{});  // nothing reached the table
+    EXPECT_EQ(iscsi_mod_add_lun_acl(&no_initiator), ERR_PARAM);
+    EXPECT_EQ(iscsi_mod_get_target_session(&list_, nullptr, &target), ERR_PARAM);
     EXPECT_EQ(iscsi_mod_stop(), ERR_OP_NOT_PROVIDED);
-
-    EXPECT_EQ(iscsi_mod_set_dataout_timeout(0, &target_), 19);
-    EXPECT_EQ(rec, (call{9, &target_, nullptr, 0}));
-    EXPECT_EQ(iscsi_mod_add_lun_mapping(&lun_, &target_, 255), 25);
-    EXPECT_EQ(rec, (call{15, &lun_, &target_, 255}));
-    list_t other;
-    EXPECT_EQ(iscsi_mod_get_target_session(&list_, &other, &target_), 31);
-    EXPECT_EQ(rec, (call{21, &list_, &other, 0}));
+    EXPECT_EQ(iscsi_mod_set_dataout_timeout(0, &target), ERR_OP_NOT_PROVIDED);
+    EXPECT_EQ(iscsi_mod_add_lun_acl(&acl), ERR_OP_NOT_PROVIDED);
 }
 
 // Through the table: the names a kernel makes, not the others (portals.tree).
@@ -107,7 +58,7 @@ TEST_F(ModTest, PortalsOfATargetByNameAndTag)
 {
     ASSERT_EQ(iscsi_mod_select(ISCSI_MOD_TYPE_LIO), 0);
     load_tree("portals.tree");
-    ASSERT_EQ(iscsi_mod_get_target_ip_list_in_target_parm(&list_, "iqn.2026-01.test:t1", 1), 0);
+    ASSERT_EQ(iscsi_mod_get_target_ip_list_in_target_parm(&list_, IQN, 1), 0);
     ASSERT_EQ(list_.count, 3);
     iscsi_ip_t *ll = iscsi_ip_search_list_by_IPv6(&list_, "fe80::1");
     ASSERT_TRUE(ll && iscsi_ip_search_list_by_IPv4(&list_, "10.0.0.1") &&
@@ -120,31 +71,43 @@ TEST_F(ModTest, PortalsOfATargetByNameAndTag)
         std::string iqn;
         int tpgt, rc;
     } bad[] = {
-        {"iqn.2026-01.test:t2", 1, ERR_CONFIGFS}, {"iqn.2026-01.test:t1", 2, ERR_CONFIGFS}, {"", 1, ERR_PARAM},
-        {"iqn.2026-01.test:t1", -1, ERR_PARAM}, {std::string(300, 'a'), 1, ERR_PARAM},
+        {"iqn.2026-01.test:t2", 1, ERR_CONFIGFS}, {IQN, 2, ERR_CONFIGFS}, {"", 1, ERR_PARAM},
+        {IQN, -1, ERR_PARAM}, {std::string(300, 'a'), 1, ERR_PARAM},
     };
     for (const auto &b : bad)
         EXPECT_EQ(iscsi_mod_get_target_ip_list_in_target_parm(&list_, b.iqn.c_str(), b.tpgt), b.rc) << b.iqn << b.tpgt;
     EXPECT_EQ(list_.count, 3) << "a failed read adds nothing";
-    iscsi_ip_free_list(&list_);
 }
 
-TEST(TargetRecordTest, FreeTakesTheRecordOffItsListWithItsPortals)
+TEST_F(ModTest, RecordsTargetsByIqnInitiatorsByExactNameAndWhatTheirFreeReleases)
 {
     iscsi_target_t *t = iscsi_target_new();
-    ASSERT_NE(t, nullptr);
     EXPECT_EQ(t->tpgt, -1);
-    for (int i = 0; i < 3; ++i)
-        list_append(&iscsi_ip_new()->node, &t->ip_list);
-    list_t targets;
-    list_init(&targets);
-    list_append(&t->node, &targets);
-    iscsi_target_free(t);  // portals freed too; leaks show under the sanitizer
-    EXPECT_TRUE(list_is_empty(&targets));
-
+    list_append(&iscsi_ip_new()->node, &t->ip_list);
+    list_append(&t->node, &list_);
+    iscsi_target_free(t);  // its portal too; leaks show under the sanitizer
+    EXPECT_TRUE(list_is_empty(&list_));
     iscsi_lun_t *lun = iscsi_lun_new();
     EXPECT_EQ(lun->hba_id, -1);  // unset, which backstore shutdown refuses
     iscsi_lun_free(lun);
+
+    korv::list_owner inits(iscsi_initiator_free_list);
+    iscsi_initiator_t *a = iscsi_initiator_list_add(inits.get(), "iqn.2026-01.test:a");
+    EXPECT_EQ(iscsi_initiator_list_add(inits.get(), "iqn.2026-01.test:a"), a);
+    for (const char *other : {"iqn.2026-01.test:", "iqn.2026-01.test:ab", "IQN.2026-01.test:a"})
+        EXPECT_EQ(iscsi_initiator_list_search(inits.get(), other), nullptr) << other;
+    EXPECT_EQ(iscsi_initiator_list_add(inits.get(), ""), nullptr);
+    EXPECT_EQ(iscsi_initiator_list_add(inits.get(), std::string(ISCSI_INITIATOR_LEN, 'x').c_str()), nullptr);
+    EXPECT_EQ(inits.get()->count, 1);
+
+    iscsi_target_t t1b = target, t1x = target, empty{};
+    t1b.tpgt = 2;
+    set(t1x.iqn, std::string(IQN) + "x");
+    EXPECT_EQ(iscsi_target_cmp(&target, &t1b), 1) << "the portal group takes no part";
+    EXPECT_EQ(iscsi_target_cmp(&target, &t1x), 0);
+    EXPECT_EQ(iscsi_target_cmp(&t1x, &target), 0);
+    EXPECT_EQ(iscsi_target_cmp(&empty, &empty), 0);
+    EXPECT_EQ(iscsi_target_cmp(&target, nullptr), 0);
 }
 
 }  // namespace
