@@ -2,8 +2,8 @@
 // The one fixture of the kernel driver's host tests: an emptied system root
 // that sample configfs trees (tests/kernel/data/*.tree) are loaded into, and
 // the records the operations take: target iqn.2026-01.test:t1 portal group 1,
-// LUN disk1 on a file, its mapping as LUN 3 and initiator i1's right to it.
-// Every test file of the driver includes this header alone.
+// LUN disk1 on a file, its mapping as LUN 3 and initiator i1's right to it;
+// and the caller of a session listing. Each test file includes this alone.
 #pragma once
 
 #include <unistd.h>
@@ -12,6 +12,7 @@
 #include <cstring>
 #include <filesystem>
 #include <fstream>
+#include <memory>
 #include <set>
 #include <sstream>
 #include <string>

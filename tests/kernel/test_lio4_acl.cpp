@@ -30,6 +30,8 @@ TEST_F(Lio4Acl, NodesGetTheTargetsCredentialsUnderAnExistingPortalGroupOnly)
     mkdirs(i2 + "/auth");
     ASSERT_EQ(lio3_add_acl_initiator("iqn.2026-01.test:i2", &target), 0);
     EXPECT_EQ(read_file(i2 + "/auth/password"), "pa$(touch x)ss12");
+    ASSERT_EQ(lio3_del_acl_initiator("iqn.2026-01.test:i2", &target), 0);
+    EXPECT_FALSE(exists(i2));
 
     target.tpgt = 2;  // a portal group that is not there is not made on the way
     EXPECT_EQ(lio3_add_acl_initiator(I1, &target), ERR_TARGET_NOT_IN_KERNEL);

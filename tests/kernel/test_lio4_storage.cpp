@@ -86,8 +86,9 @@ TEST_F(Lio4Storage, MappingChecksThenSetsTheAluaSwitchAndTakesItsStateBack)
     EXPECT_EQ(lio3_add_lun_mapping(&lun, &target, 0), ERR_LUN_ALREADY_MAPPED);
     EXPECT_EQ(lio3_add_lun_mapping(&lun, &target, 1), ERR_PARAM);  // the record says 0
 
-    // The kernel's attributes go with the group (here by hand), and the
-    // group's ALUA state with it.
+    // The kernel's attributes are left to go with the group (here by hand),
+    // and the group's ALUA state with it.
+    EXPECT_EQ(lio3_del_lun_mapping(&lun, &target), ERR_CONFIGFS);
     std::remove((l0 + "/alua_tg_pt_write_md").c_str());
     EXPECT_EQ(lio3_del_lun_mapping(&lun, &target), 0);
     EXPECT_FALSE(exists(l0) || exists(at("/var/target/alua/iSCSI/iqn.2026-01.test:t1+1/lun_0")));
