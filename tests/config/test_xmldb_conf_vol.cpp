@@ -1,6 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
 // The per-volume summaries under "/iscsi/lun/total_size": lookup by UUID and
 // the rewrite from a volume list, checked against whole dumps of the store.
+#include <iterator>
+#include <regex>
 #include <sstream>
 
 #include "common/korvadm_sys.h"
@@ -53,11 +55,9 @@ TEST_F(VolSummaries, FailingWritesGiveUpAfterThreeAttempts)
     db().stop();
     std::string log;
     EXPECT_EQ(quiet([&] { return xmldb_update_total_vol_size_info(vols_.get()); }, &log), ERR_DB_WRITE);
-    size_t attempts = 0;
-    for (size_t at = 0; (at = log.find("xmldbc_set(/iscsi/lun/total_size/id:1/uuid) failed \n", at)) != std::string::npos;
-         ++at)
-        ++attempts;
-    EXPECT_EQ(attempts, 3u) << log;
+    const std::regex attempt("xmldbc_set\\(/iscsi/lun/total_size/id:1/uuid\\) failed \n");
+    const auto attempts = std::distance(std::sregex_iterator(log.begin(), log.end(), attempt), std::sregex_iterator());
+    EXPECT_EQ(attempts, 3) << log;
 }
 
 }  // namespace
