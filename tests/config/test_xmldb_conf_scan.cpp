@@ -7,13 +7,11 @@
 
 using namespace korv_test;
 
-using IdEntryScan = StoreTest;
+constexpr char kScan[] = "scan.xml";
+using IdEntryScan = LoadedStore<kScan>;
 
 TEST_F(IdEntryScan, MatchesWholeValuesUpToTheLimitAndAnEmptyKeyHidesTheRest)
 {
-    put("/l/id:1/name", "a");
-    put("/l/id:2/name", "");
-    put("/l/id:3/name", "c");
     int found = -1, free = -1;
     EXPECT_EQ(_search_xmldb_id_entry(&found, "/l", 10, "name", "a"), ID_ENTRY_FOUND);
     EXPECT_EQ(_get_free_xmldb_id_entry(&free, "/l", 10, "name"), ID_ENTRY_FOUND);
@@ -22,20 +20,16 @@ TEST_F(IdEntryScan, MatchesWholeValuesUpToTheLimitAndAnEmptyKeyHidesTheRest)
     EXPECT_EQ(found, 0);
 
     // Whole values only, and never past the limit.
-    put("/l/id:2/name", "abc");
-    EXPECT_EQ(_search_xmldb_id_entry(&found, "/l", 10, "name", "ab"), ID_ENTRY_NOT_FOUND);
-    EXPECT_EQ(_search_xmldb_id_entry(&found, "/l", 2, "name", "c"), ID_ENTRY_NOT_FOUND);
-    EXPECT_EQ(_search_xmldb_id_entry(&found, "/l", 3, "name", "c"), ID_ENTRY_FOUND);
-    EXPECT_EQ(slash(_cal_xmldb_id_entry_count("/l", 2, "name"), _get_free_xmldb_id_entry(&free, "/l", 3, "name")),
+    EXPECT_EQ(_search_xmldb_id_entry(&found, "/m", 10, "name", "ab"), ID_ENTRY_NOT_FOUND);
+    EXPECT_EQ(_search_xmldb_id_entry(&found, "/m", 2, "name", "c"), ID_ENTRY_NOT_FOUND);
+    EXPECT_EQ(_search_xmldb_id_entry(&found, "/m", 3, "name", "c"), ID_ENTRY_FOUND);
+    EXPECT_EQ(slash(_cal_xmldb_id_entry_count("/m", 2, "name"), _get_free_xmldb_id_entry(&free, "/m", 3, "name")),
               slash(2, ID_ENTRY_NOT_FOUND));
     EXPECT_EQ(quiet([&] { return _search_xmldb_id_entry(&found, nullptr, 10, "name", "a"); }), ERR_PARAM);
 
     // Counters never go below zero; a negative one counts as 0.
-    put("/iscsi/lun/count", "-5");
     EXPECT_EQ(_xmldb_inc_lun_count() + _xmldb_inc_target_count() + _xmldb_inc_target_lun_map_cnt(3), KORV_OK);
     EXPECT_EQ(raw("/iscsi/lun/count") + raw("/iscsi/target/count") + raw(tpath(3, "map_lun/count")), "111");
-    put("/iscsi/acl/id:1/initiator", "iqn.a");
-    put("/iscsi/acl/id:3/initiator", "iqn.c");
     EXPECT_EQ(iscsi_conf_ops.xmldb_update_current_aclcnt(), KORV_OK);
     EXPECT_EQ(raw("/iscsi/acl/count"), "1");
 }
