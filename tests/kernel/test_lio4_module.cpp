@@ -19,15 +19,20 @@ protected:
     std::string calls() { return read_file(at("/calls.log")); }
 };
 
-// The real kernel's module order, configfs mount and roll-back are the VM
-// suite's; here what a real kernel will not show.
+// The real kernel only shows configfs mounted and the modules gone; the order
+// of the calls and the roll-back are seen here, in the stand-ins' log.
 TEST_F(ModuleTest, StartAndStopFromRunning)
 {
     install_all();
     ASSERT_EQ(lio3_start_module(), 0);
+    const std::string m = modules();
+    EXPECT_LT(m.find("target_core_mod"), m.find("target_core_file"));
+    EXPECT_LT(m.find("target_core_file"), m.find("iscsi_target_mod"));
+    EXPECT_NE(m.find("iscsi_target_mod"), std::string::npos);
     EXPECT_TRUE(exists(at("/var/target/alua")));
     mkdirs(at(CORE + "/alua"));
     EXPECT_EQ(lio3_stop_module(), 0);
+    EXPECT_EQ(modules(), "");
     EXPECT_TRUE(exists(at(CORE + "/alua"))) << "the kernel's own group";
 
     // configfs stays mounted: a second start does not mount again.
@@ -35,8 +40,19 @@ TEST_F(ModuleTest, StartAndStopFromRunning)
     std::string c = calls();
     EXPECT_EQ(c.find("mount "), c.rfind("mount "));
 
-    // Only the core module may be missing: start goes on and logs it.
+    // Any other module missing: start fails and takes out, in reverse, what
+    // it inserted.
     ASSERT_EQ(lio3_stop_module(), 0);
+    std::remove(at("/usr/local/modules/driver/iscsi_target_mod.ko").c_str());
+    std::remove(at("/calls.log").c_str());
+    EXPECT_EQ(lio3_start_module(), ERR_MODULE_START);
+    EXPECT_EQ(modules(), "");
+    c = calls();
+    EXPECT_LT(c.find("rmmod target_core_file"), c.find("rmmod target_core_mod"));
+    EXPECT_NE(c.find("rmmod target_core_mod"), std::string::npos);
+
+    // Only the core module may be missing: start goes on and logs it.
+    install_all();
     std::remove(at("/usr/local/modules/driver/target_core_mod.ko").c_str());
     std::string log = capture_stdout([] { EXPECT_EQ(lio3_start_module(), 0); });
     EXPECT_NE(log.find("Insert module target_core_mod.ko failed"), std::string::npos);
