@@ -26,6 +26,7 @@
 //
 //   bench_nesrad [runs]     (default 20; needs isnsd and isnsadm)
 //   bench_nesrad --memory
+//   bench_nesrad --trace OUT   (nesrad under valgrind; see trace_mode)
 #include <arpa/inet.h>
 #include <fcntl.h>
 #include <signal.h>
@@ -265,6 +266,43 @@ memory memory_of(pid_t pid)
     return m;
 }
 
+// Private memory (clean and dirty) of a process per mapping, KiB, keyed by
+// the mapped file's name (the program itself as "program") and permissions.
+std::vector<std::pair<std::string, long>> private_by_mapping(pid_t pid)
+{
+    const std::string proc = "/proc/" + std::to_string(pid);
+    char exe[4096] = {};
+    if (readlink((proc + "/exe").c_str(), exe, sizeof exe - 1) < 0)
+        die("cannot read the program of pid " + std::to_string(pid));
+    std::vector<std::pair<std::string, long>> out;
+    std::ifstream in(proc + "/smaps");
+    std::string label;
+    for (std::string line; std::getline(in, line);) {
+        char key[32], perms[8] = {}, path[4096] = {};
+        long kib = 0;
+        if (std::sscanf(line.c_str(), "%*x-%*x %7s %*s %*s %*s %4095s", perms, path) >= 1) {  // a mapping's heading
+            std::string name = path;
+            if (name == exe)
+                name = "program";
+            else if (name.empty())
+                name = "[anonymous]";
+            else
+                name = name.substr(name.rfind('/') + 1);
+            label = name + " " + std::string(perms, 3);
+            continue;
+        }
+        if (std::sscanf(line.c_str(), "%31s %ld kB", key, &kib) != 2 ||
+            (std::strcmp(key, "Private_Clean:") != 0 && std::strcmp(key, "Private_Dirty:") != 0))
+            continue;
+        auto at = std::find_if(out.begin(), out.end(), [&](const auto &e) { return e.first == label; });
+        if (at == out.end())
+            out.emplace_back(label, kib);
+        else
+            at->second += kib;
+    }
+    return out;
+}
+
 // Follows one program to its steady check loop: all targets held by its
 // server, then its first check made (it left its wait, and waits again).
 struct follow {
@@ -312,6 +350,7 @@ int memory_mode(const std::string &adm_conf, const std::string &bare_adm)
         std::this_thread::sleep_for(std::chrono::milliseconds(200));
     }
     const memory d = memory_of(runs[0].c.pid), b = memory_of(runs[1].c.pid);
+    auto dm = private_by_mapping(runs[0].c.pid), bm = private_by_mapping(runs[1].c.pid);
     kill(runs[1].c.pid, SIGTERM);
     reap(runs[1].c);
     kill(runs[0].c.pid, SIGTERM);
@@ -329,8 +368,41 @@ int memory_mode(const std::string &adm_conf, const std::string &bare_adm)
                 static_cast<double>(d.dirty) / static_cast<double>(b.dirty));
     std::printf("goal: Pss and Private each <= 1.5 x the bare program's: %s\n",
                 pss <= 1.5 && priv <= 1.5 ? "met" : "NOT met");
+    std::printf("\nPrivate per mapping, KiB        nesrad   bare\n");
+    for (const auto &[label, kib] : bm)
+        if (std::none_of(dm.begin(), dm.end(), [&](const auto &e) { return e.first == label; }))
+            dm.emplace_back(label, 0);
+    std::stable_sort(dm.begin(), dm.end(), [](const auto &x, const auto &y) { return x.second > y.second; });
+    for (const auto &[label, kib] : dm) {
+        auto at = std::find_if(bm.begin(), bm.end(), [&](const auto &e) { return e.first == label; });
+        if (kib || at != bm.end())
+            std::printf("%-32s %6ld %6ld\n", label.c_str(), kib, at == bm.end() ? 0L : at->second);
+    }
     std::printf("nesrad exit status after SIGTERM: %d\n", status);
     return status == 0 ? 0 : 1;
+}
+
+// --trace OUT: nesrad under valgrind's lackey through its start, its
+// registration pass, its first check and its stop: every instruction and
+// data address it touched in OUT, its mappings in OUT.maps
+// (scripts/nesrad-layout turns them into the link's layout).
+int trace_mode(const std::string &adm_conf, const std::string &out)
+{
+    follow run{"nesrad",
+               spawn({"/usr/bin/valgrind", "--tool=lackey", "--trace-mem=yes", "--log-file=" + out, NESRAD_BIN,
+                      kServer}),
+               adm_conf};
+    auto deadline = clock_type::now() + std::chrono::seconds(300);
+    while (!run.steady) {
+        if (clock_type::now() > deadline)
+            die("no steady check loop under valgrind within 300 s");
+        run.step();
+        std::this_thread::sleep_for(std::chrono::milliseconds(200));
+    }
+    std::ifstream maps("/proc/" + std::to_string(run.c.pid) + "/maps");
+    std::ofstream(out + ".maps") << maps.rdbuf();
+    kill(run.c.pid, SIGTERM);
+    return reap(run.c).status == 0 ? 0 : 1;
 }
 
 double median(std::vector<double> v)
@@ -351,7 +423,8 @@ int main(int argc, char **argv)
     if (argc > 1 && std::strcmp(argv[1], "--floor") == 0)
         return floor_mode();
     const bool memory_run = argc > 1 && std::strcmp(argv[1], "--memory") == 0;
-    int runs = argc > 1 && !memory_run ? std::atoi(argv[1]) : 20;
+    const bool trace_run = argc > 2 && std::strcmp(argv[1], "--trace") == 0;
+    int runs = argc > 1 && !memory_run && !trace_run ? std::atoi(argv[1]) : 20;
     if (runs < 1)
         die("usage: bench_nesrad [runs]");
 
@@ -396,6 +469,15 @@ int main(int argc, char **argv)
 
     std::string adm_conf;
     child isnsd = start_isnsd(kServer, "isns", &adm_conf);
+    if (argc > 2 && std::strcmp(argv[1], "--trace") == 0) {
+        int rc = trace_mode(adm_conf, argv[2]);
+        kill(isnsd.pid, SIGTERM);
+        reap(isnsd);
+        kill(xmldbd, SIGTERM);
+        waitpid(xmldbd, nullptr, 0);
+        std::system(("rm -rf '" + g_root + "'").c_str());
+        return rc;
+    }
     if (memory_run) {
         std::string bare_adm;
         child bare_isnsd = start_isnsd(kBareServer, "isns-bare", &bare_adm);
