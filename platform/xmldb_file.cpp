@@ -85,7 +85,9 @@ bool read_file(const std::string &path, std::string &out, std::string &err)
     }
     out.clear();
     out.reserve(static_cast<size_t>(st.st_size));
-    char buf[65536];
+    // A page: the daemon reads its small files through here, and its stack
+    // keeps every page it ever touched for as long as it runs.
+    char buf[4096];
     for (;;) {
         ssize_t n = ::read(f.fd, buf, sizeof buf);
         if (n == 0)
