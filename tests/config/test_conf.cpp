@@ -71,7 +71,8 @@ TEST_F(ConfContext, InitTakesTheHostNameInIqnFormOrFails)
 
 TEST_F(ConfContext, StoredDebugLevelBecomesTheProcessLevelWhenReadable)
 {
-    // Adopting a stored level is checked by the daemon's suite, which stores 1.
+    // The daemon's suite sees a stored level adopted (it stores 1); here the
+    // level read is reported and returned.
     int level = 7;
     EXPECT_EQ(slash(xmldb_get_debug_level(&level), level), slash(ERR_INT_VALUE, 0));
     // Unset, or a table without the slot: the process level stays.
@@ -85,4 +86,7 @@ TEST_F(ConfContext, StoredDebugLevelBecomesTheProcessLevelWhenReadable)
     g_korv_debug_level = 0;
     EXPECT_EQ(xmldb_set_debug_level(2), KORV_OK);
     EXPECT_EQ(slash(xmldb_get_debug_level(&level), level), "0/2");
+    ctx.ops = &iscsi_conf_ops;
+    EXPECT_EQ(logged([&] { return dbg_get_conf_target_debug_lv(&ctx); }, "get debug level = 2\n"), 2);
+    g_korv_debug_level = 0;
 }

@@ -23,13 +23,20 @@ protected:
 
 TEST_F(Lio4Acl, NodesGetTheTargetsCredentialsUnderAnExistingPortalGroupOnly)
 {
+    // The kernel's policy for initiators without an ACL is not an ACL.
+    EXPECT_EQ(lio3_add_acl_initiator("default_policy", &target), 0);
+    EXPECT_FALSE(exists(tpg() + "/acls/default_policy"));
+
     const std::string i2 = tpg() + "/acls/iqn.2026-01.test:i2";
     target.chap = 1;
     set(target.chap_user, "user");
     set(target.chap_pass, "pa$(touch x)ss12");
+    target.dataout_timeout = 7;
     mkdirs(i2 + "/auth");
+    mkdirs(i2 + "/attrib");
     ASSERT_EQ(lio3_add_acl_initiator("iqn.2026-01.test:i2", &target), 0);
     EXPECT_EQ(read_file(i2 + "/auth/password"), "pa$(touch x)ss12");
+    EXPECT_EQ(read_file(i2 + "/attrib/dataout_timeout"), "7");
     ASSERT_EQ(lio3_del_acl_initiator("iqn.2026-01.test:i2", &target), 0);
     EXPECT_FALSE(exists(i2));
 
@@ -39,10 +46,17 @@ TEST_F(Lio4Acl, NodesGetTheTargetsCredentialsUnderAnExistingPortalGroupOnly)
 }
 
 // What each right does to the kernel and its sessions is the VM suite's;
-// here rights that cannot be set, and what they leave.
+// here a removal, rights that cannot be set, and what they leave.
 TEST_F(Lio4Acl, ARightThatCannotBeSetGrantsNothing)
 {
     std::string node = tpg() + "/acls/" + I1 + "/lun_3";
+    // Removing is a deny whatever right the record holds (the VM suite's
+    // records already hold none).
+    ASSERT_EQ(apply(3, 2), 0);
+    std::remove((node + "/write_protect").c_str());  // the kernel's, gone with its group
+    EXPECT_EQ(lio3_del_lun_acl(&acl), 0);
+    EXPECT_EQ(acl.access_right, 0);
+    EXPECT_FALSE(exists(node));
     EXPECT_EQ(apply(3, 3), ERR_PARAM);
     EXPECT_EQ(apply(256, 1), ERR_PARAM);
     EXPECT_EQ(apply(4, 1), ERR_CONFIGFS);  // no LUN 4 in the target

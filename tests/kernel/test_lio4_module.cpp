@@ -29,7 +29,7 @@ TEST_F(ModuleTest, StartAndStopFromRunning)
     EXPECT_LT(m.find("target_core_mod"), m.find("target_core_file"));
     EXPECT_LT(m.find("target_core_file"), m.find("iscsi_target_mod"));
     EXPECT_NE(m.find("iscsi_target_mod"), std::string::npos);
-    EXPECT_TRUE(exists(at("/var/target/alua")));
+    EXPECT_TRUE(exists(at("/var/target/pr")) && exists(at("/var/target/alua")));
     mkdirs(at(CORE + "/alua"));
     EXPECT_EQ(lio3_stop_module(), 0);
     EXPECT_EQ(modules(), "");
