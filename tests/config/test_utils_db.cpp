@@ -38,7 +38,6 @@ TEST_F(TypedAccess, WritesRoundTripAndAnEmptyStringClears)
     EXPECT_EQ(raw("/t/i") + " " + raw("/t/u"), "-2147483648 18446744073709551615");
     uint64_t u = 0;
     EXPECT_EQ(slash(xmldb_get_uint64_t(&u, "/t/u"), u), "0/18446744073709551615");
-    capture_stderr([&] { EXPECT_EQ(slash(xmldb_get_uint64_t(&u, "/t/huge"), u), slash(ERR_INT_VALUE, 0)); });
 
     EXPECT_EQ(xmldb_set_cstring("", "/t/i"), KORV_OK);
     int32_t v = 3;

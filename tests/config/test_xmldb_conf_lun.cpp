@@ -119,10 +119,8 @@ TEST_F(LunRecords, CarryEveryFieldOrItsUnknownValue)
     EXPECT_EQ(records<lun_conf_t>(xmldb_get_all_lun_conf_in_crash_conf, lun_conf_free_list), "a/3/1 bare/-1/2");
     EXPECT_EQ(records<lun_conf_t>(xmldb_get_all_lun_conf_lite, lun_conf_free_list), "a/-1/1 bare/-1/2");
     lun_ptr one(lun_conf_new(), lun_conf_free);
-    EXPECT_EQ(xmldb_get_lun_conf_by_uuid(one.get(), "vol-a"), KORV_OK);
-    EXPECT_EQ(slash(one->name, one->lun_num), "a/7");
-    EXPECT_EQ(xmldb_get_lun_conf_by_name(one.get(), "bare"), KORV_OK);
-    EXPECT_EQ(slash(one->name, one->dbidx), "bare/2");
+    EXPECT_EQ(slash(xmldb_get_lun_conf_by_uuid(one.get(), "vol-a"), one->name, one->lun_num), "0/a/7");
+    EXPECT_EQ(slash(xmldb_get_lun_conf_by_name(one.get(), "bare"), one->name, one->dbidx), "0/bare/2");
     EXPECT_EQ(quiet([&] { return xmldb_get_lun_conf_by_uuid(one.get(), "vol-zz"); }), ERR_NOT_FOUND);
     EXPECT_EQ(quiet([&] { return xmldb_get_lun_conf_by_name(one.get(), "zz"); }), ERR_NOT_FOUND);
 }

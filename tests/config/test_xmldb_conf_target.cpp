@@ -102,12 +102,11 @@ TEST_F(BrokenTargets, ReadersSkipBrokenRecordsAndFillEveryFieldChapOnlyWhenOn)
     EXPECT_NE(log.find("get target tpgt error"), std::string::npos) << log;
 
     target_ptr one(target_conf_new(), target_conf_free);
-    EXPECT_EQ(xmldb_get_target_conf_by_name(one.get(), "c"), KORV_OK);
-    EXPECT_EQ(slash(one->iqn, one->chap_name, one->chap_pwd, one->dbidx),
-              "iqn.2000-01.com.example:c/user/secret12345678/5");
+    EXPECT_EQ(slash(xmldb_get_target_conf_by_name(one.get(), "c"), one->iqn, one->chap_name, one->chap_pwd, one->dbidx),
+              "0/iqn.2000-01.com.example:c/user/secret12345678/5");
     one.reset(target_conf_new());
-    EXPECT_EQ(xmldb_get_target_conf_by_name(one.get(), "a"), KORV_OK);
-    EXPECT_EQ(slash(one->chap_enable, one->chap_name, one->status), "0//Ready");
+    EXPECT_EQ(slash(xmldb_get_target_conf_by_name(one.get(), "a"), one->chap_enable, one->chap_name, one->status),
+              "0/0//Ready");
     EXPECT_EQ(quiet([&] { return xmldb_get_target_conf_by_name(one.get(), "zz"); }), ERR_NOT_FOUND);
     EXPECT_EQ(quiet([&] { return xmldb_get_target_conf_by_name(one.get(), raw(tpath(2, "name")).c_str()); }),
               ERR_PARAM);
