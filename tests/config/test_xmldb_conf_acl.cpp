@@ -33,17 +33,10 @@ TEST_F(Acl, GrantingAddsAnUnknownInitiatorAndWritesBothSides)
     EXPECT_EQ(slash(xmldb_get_initiator_name_from_alias(buf, 5, "B"), buf), "0/");  // does not fit: none
 
     // Refused grants write nothing, not even the initiator.
-    const struct {
-        const char *initiator, *lun, *message;
-        int right;
-    } refused[] = {
-        {"iqn.c", "l1", "access right error", 3},
-        {"", "l1", "initiator name error", 1},
-        {"iqn.c", "", "lun name error", 1},
-        {"iqn.c", "l9", "lun name not exist", 1},
-    };
-    for (const auto &r : refused)
-        EXPECT_EQ(logged([&] { return xmldb_set_lun_acl(r.initiator, "C", r.lun, r.right); }, r.message), ERR_PARAM);
+    EXPECT_EQ(logged([] { return xmldb_set_lun_acl("iqn.c", "C", "l1", 3); }, "access right error"), ERR_PARAM);
+    EXPECT_EQ(logged([] { return xmldb_set_lun_acl("", "C", "l1", 1); }, "initiator name error"), ERR_PARAM);
+    EXPECT_EQ(logged([] { return xmldb_set_lun_acl("iqn.c", "C", "", 1); }, "lun name error"), ERR_PARAM);
+    EXPECT_EQ(logged([] { return xmldb_set_lun_acl("iqn.c", "C", "l9", 1); }, "lun name not exist"), ERR_PARAM);
     EXPECT_EQ(sides(), data("acl_granted.txt"));
 }
 

@@ -78,24 +78,17 @@ TEST_F(LunRecords, EachFieldOperationReadsOrWritesItsOwnFieldOfTheNamedLun)
 TEST_F(LunRecords, BadNamesAndBadValuesWriteNothing)
 {
     const std::string before = dump("/iscsi/lun");
-    static char buf[8];
-    const struct {
-        int rc;
-        const char *message;
-        int (*call)();
-    } refused[] = {
-        {ERR_NOT_FOUND, "can not find zz in xmldb entry", [] { return xmldb_set_lun_vol_state(1, "zz"); }},
-        {ERR_NOT_FOUND, "can not find zz in xmldb lun entry", [] { return xmldb_get_lun_serial(buf, 8, "zz"); }},
-        {ERR_PARAM, "lun name error", [] { return xmldb_set_lun_size(1, ""); }},
-        {ERR_PARAM, "vol state error", [] { return xmldb_set_lun_vol_state(-1, "a"); }},
-        {ERR_PARAM, "prealloc_state error", [] { return xmldb_set_lun_prealloc_state(-2, "a"); }},
-        {ERR_PARAM, "connect state error", [] { return xmldb_set_lun_connect_state(-1, "a"); }},
-        {ERR_PARAM, "prealloc_progress error", [] { return xmldb_set_lun_prealloc_progress(101, "a"); }},
-        {ERR_PARAM, "prealloc_progress error", [] { return xmldb_set_lun_prealloc_progress(-1, "a"); }},
-        {ERR_PARAM, "status error", [] { return xmldb_set_lun_status(nullptr, "a"); }},
-    };
-    for (const auto &r : refused)
-        EXPECT_EQ(logged(r.call, r.message), r.rc);
+    char buf[8];
+    EXPECT_EQ(logged([] { return xmldb_set_lun_vol_state(1, "zz"); }, "can not find zz in xmldb entry"), ERR_NOT_FOUND);
+    EXPECT_EQ(logged([&] { return xmldb_get_lun_serial(buf, 8, "zz"); }, "can not find zz in xmldb lun entry"),
+              ERR_NOT_FOUND);
+    EXPECT_EQ(logged([] { return xmldb_set_lun_size(1, ""); }, "lun name error"), ERR_PARAM);
+    EXPECT_EQ(logged([] { return xmldb_set_lun_vol_state(-1, "a"); }, "vol state error"), ERR_PARAM);
+    EXPECT_EQ(logged([] { return xmldb_set_lun_prealloc_state(-2, "a"); }, "prealloc_state error"), ERR_PARAM);
+    EXPECT_EQ(logged([] { return xmldb_set_lun_connect_state(-1, "a"); }, "connect state error"), ERR_PARAM);
+    EXPECT_EQ(logged([] { return xmldb_set_lun_prealloc_progress(101, "a"); }, "prealloc_progress error"), ERR_PARAM);
+    EXPECT_EQ(logged([] { return xmldb_set_lun_prealloc_progress(-1, "a"); }, "prealloc_progress error"), ERR_PARAM);
+    EXPECT_EQ(logged([] { return xmldb_set_lun_status(nullptr, "a"); }, "status error"), ERR_PARAM);
     EXPECT_EQ(dump("/iscsi/lun"), before);
     // An empty status clears it.
     EXPECT_EQ(xmldb_set_lun_status("", "a"), KORV_OK);

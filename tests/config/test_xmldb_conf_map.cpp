@@ -88,19 +88,14 @@ TEST_F(Mapping, BothSidesAgreeThroughMapAndUnmap)
 
 TEST_F(Mapping, RefusesUnknownOrEmptyNamesAndAFullMap)
 {
-    const struct {
-        int rc;
-        const char *target, *lun, *message;
-    } cases[] = {
-        {ERR_PARAM, "", "l1", "target_name error"},
-        {ERR_PARAM, "t1", "", "lun_name error"},
-        {ERR_NOT_FOUND, "t9", "l1", "can not find t9 in xmldb target entry"},
-        {ERR_NOT_FOUND, "t1", "l9", "can not find l9 in xmldb lun entry"},
-    };
     const std::string before = dump("/iscsi");
     g_korv_debug_level = 2;
-    for (const auto &c : cases)
-        EXPECT_EQ(logged([&] { return xmldb_add_target_lun_map(c.target, c.lun, 0); }, c.message), c.rc);
+    EXPECT_EQ(logged([] { return xmldb_add_target_lun_map("", "l1", 0); }, "target_name error"), ERR_PARAM);
+    EXPECT_EQ(logged([] { return xmldb_add_target_lun_map("t1", "", 0); }, "lun_name error"), ERR_PARAM);
+    EXPECT_EQ(logged([] { return xmldb_add_target_lun_map("t9", "l1", 0); }, "can not find t9 in xmldb target entry"),
+              ERR_NOT_FOUND);
+    EXPECT_EQ(logged([] { return xmldb_add_target_lun_map("t1", "l9", 0); }, "can not find l9 in xmldb lun entry"),
+              ERR_NOT_FOUND);
     g_korv_debug_level = 0;
     EXPECT_EQ(dump("/iscsi"), before);
 
