@@ -38,6 +38,8 @@ TEST_F(TypedAccess, WritesRoundTripAndAnEmptyStringClears)
     EXPECT_EQ(raw("/t/i") + " " + raw("/t/u"), "-2147483648 18446744073709551615");
     uint64_t u = 0;
     EXPECT_EQ(slash(xmldb_get_uint64_t(&u, "/t/u"), u), "0/18446744073709551615");
+    // A value the converter refuses is no number at all, not a zero.
+    capture_stderr([&] { EXPECT_EQ(slash(xmldb_get_uint64_t(&u, "/t/word"), u), slash(ERR_INT_VALUE, 0)); });
 
     EXPECT_EQ(xmldb_set_cstring("", "/t/i"), KORV_OK);
     int32_t v = 3;
