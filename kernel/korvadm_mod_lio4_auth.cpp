@@ -107,10 +107,8 @@ int _lio3_set_target_chap_all_acl(const iscsi_target_t *target)
 {
     std::string acls = tpg_dir(target->iqn, target->tpgt) + "/acls";
     std::vector<std::string> names;
-    if (!list_subdirs(acls, names)) {
-        DBG(0, "can not open directory : %s", acls.c_str());
+    if (!list_subdirs_or_log(__func__, acls, names))
         return ERR_CONFIGFS;
-    }
     for (const std::string &name : names)
         if (push_chap(__func__, target, name.c_str()) != 0)
             return ERR_CONFIGFS;

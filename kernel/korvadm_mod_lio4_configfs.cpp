@@ -66,6 +66,14 @@ bool list_subdirs(const std::string &path, std::vector<std::string> &names)
     return true;
 }
 
+bool list_subdirs_or_log(const char *func, const std::string &path, std::vector<std::string> &names)
+{
+    if (list_subdirs(path, names))
+        return true;
+    DBG_AS(func, 0, "can not open directory : %s", path.c_str());
+    return false;
+}
+
 // The decimal number at the start of text, when there is one that fits.
 bool leading_number(std::string_view text, int &out)
 {
@@ -121,10 +129,8 @@ int remove_configfs_group(const std::string &path, int depth)
 int remove_all_subdirs(const char *func, const std::string &dir)
 {
     std::vector<std::string> names;
-    if (!list_subdirs(dir, names)) {
-        DBG_AS(func, 0, "can not open directory : %s", dir.c_str());
+    if (!list_subdirs_or_log(func, dir, names))
         return ERR_PARAM;
-    }
     for (const std::string &name : names)
         if (remove_configfs_group(dir + "/" + name) != 0)
             DBG_AS(func, 2, "remove %s/%s failed", dir.c_str(), name.c_str());

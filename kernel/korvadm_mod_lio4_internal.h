@@ -101,6 +101,9 @@ tcheck check_target(const iscsi_target_t *t);
 bool list_subdirs(const std::string &path, std::vector<std::string> &names);
 // The decimal number at the start of text, when there is one that fits.
 bool leading_number(std::string_view text, int &out);
+// list_subdirs, logging "can not open directory" under `func` when path
+// cannot be opened.
+bool list_subdirs_or_log(const char *func, const std::string &path, std::vector<std::string> &names);
 // Removes a configfs group with everything in it; -9973 when it remains.
 int remove_configfs_group(const std::string &path, int depth = 0);
 // Removes every sub-directory of dir, ignoring single failures; -9989 when

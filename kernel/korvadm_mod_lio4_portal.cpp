@@ -122,10 +122,8 @@ int _get_exist_ip_list(const iscsi_target_t *target, list_t *list)
 {
     std::string np = tpg_dir(target->iqn, target->tpgt) + "/np";
     std::vector<std::string> names;
-    if (!list_subdirs(np, names)) {
-        DBG(0, "can not open directory : %s", np.c_str());
+    if (!list_subdirs_or_log(__func__, np, names))
         return ERR_PARAM;
-    }
     korv::list_owner found(iscsi_ip_free_list);
     for (const std::string &name : names) {
         DBG(2, "get one existing np : %s", name.c_str());
@@ -158,10 +156,8 @@ int _lio3_remove_all_np(const iscsi_target_t *target)
 {
     std::string np = tpg_dir(target->iqn, target->tpgt) + "/np";
     std::vector<std::string> names;
-    if (!list_subdirs(np, names)) {
-        DBG(0, "can not open directory : %s", np.c_str());
+    if (!list_subdirs_or_log(__func__, np, names))
         return ERR_PARAM;
-    }
     for (const std::string &name : names) {
         std::string path = np + "/" + name;
         if (remove_dir(path.c_str()) != 0) {

@@ -123,10 +123,8 @@ int _lio3_shutdown_all_hba(void)
     if (configfs_path_exist(core.c_str()) != 0)
         return KORV_OK;
     std::vector<std::string> names;
-    if (!list_subdirs(core, names)) {
-        DBG(0, "can not open directory : %s", core.c_str());
+    if (!list_subdirs_or_log(__func__, core, names))
         return ERR_PARAM;
-    }
     int rc = KORV_OK;
     for (const std::string &name : names) {
         if (name == "alua")

@@ -271,10 +271,8 @@ int lio3_set_target_attr_dataout_timeout(int timeout, iscsi_target_t *target)
     }
     std::string acls = tpg_dir(target->iqn, target->tpgt) + "/acls";
     std::vector<std::string> names;
-    if (!list_subdirs(acls, names)) {
-        DBG(0, "can not open directory : %s", acls.c_str());
+    if (!list_subdirs_or_log(__func__, acls, names))
         return ERR_CONFIGFS;
-    }
     for (const std::string &name : names) {
         int rc = _lio3_set_target_acl_dataout_timeout(timeout, target->iqn, target->tpgt, name.c_str());
         if (rc != 0)
@@ -309,10 +307,8 @@ int _lio3_remove_all_tpgt(iscsi_target_t *target)
     PARAM_GUARD(!target || !is_component(field_str(target->iqn)));
     std::string dir = iqn_dir(target->iqn);
     std::vector<std::string> names;
-    if (!list_subdirs(dir, names)) {
-        DBG(0, "can not open directory : %s", dir.c_str());
+    if (!list_subdirs_or_log(__func__, dir, names))
         return ERR_PARAM;
-    }
     int rc = KORV_OK;
     for (const std::string &name : names) {
         size_t at = name.find("tpgt_");
@@ -345,10 +341,8 @@ int _lio3_remove_all_iscsi_target(void)
         return ERR_NO_MEMORY;
     }
     std::vector<std::string> names;
-    if (!list_subdirs(fabric, names)) {
-        DBG(0, "can not open directory : %s", fabric.c_str());
+    if (!list_subdirs_or_log(__func__, fabric, names))
         return ERR_PARAM;
-    }
     for (const std::string &name : names) {
         if (name == "discovery_auth" || name == "lio_version" || name == "sessions")
             continue;
