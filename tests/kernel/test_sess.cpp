@@ -8,14 +8,6 @@ namespace {
 
 const uint8_t kIsid[ISCSI_ISID_LEN] = {0x80, 0x28, 0x09, 0x49, 0x00, 0x01};
 
-iscsi_target_t *new_target(const char *iqn)
-{
-    iscsi_target_t *t = iscsi_target_new();
-    std::strcpy(t->iqn, iqn);
-    t->tpgt = 1;
-    return t;
-}
-
 struct World : korv_test::Listing {
     iscsi_initiator_t *a = iscsi_initiator_list_add(&initiators, "iqn.2026-01.test:a");
     iscsi_initiator_t *b = iscsi_initiator_list_add(&initiators, "iqn.2026-01.test:b");
@@ -47,7 +39,8 @@ TEST(Sess, FreeingUnlinksFromEveryListAndARecordGoneLeavesItsSessionsWithoutIt)
     iscsi_initiator_free(w.b);
     EXPECT_EQ(s2->initiator, nullptr);
     EXPECT_EQ(s2->initiator_node.list, nullptr);
-    iscsi_target_t *t2 = new_target("iqn.2026-01.test:t2");
+    iscsi_target_t *t2 = iscsi_target_new();
+    std::strcpy(t2->iqn, "iqn.2026-01.test:t2");
     iscsi_sess_t *s4 = w.listed(t2, w.a, 4);
     iscsi_target_free(t2);
     EXPECT_EQ(s4->target, nullptr);
@@ -65,16 +58,17 @@ TEST(Sess, SameSessionIsSameIdTargetIqnAndInitiatorName)
     World w;
     iscsi_sess_t *s = iscsi_sess_list_add(&w.sessions, 5, kIsid, 3, w.target, w.a);
     ASSERT_NE(s, nullptr);
-    iscsi_target_t *same_iqn = new_target("iqn.2026-01.test:t1");
+    iscsi_target_t same_iqn{};
+    std::strcpy(same_iqn.iqn, w.target->iqn);
     iscsi_initiator_t *same_name = iscsi_initiator_new();
     std::strcpy(same_name->name, "iqn.2026-01.test:a");
-    EXPECT_EQ(iscsi_sess_list_search(&w.sessions, 5, same_iqn, same_name), s);
+    EXPECT_EQ(iscsi_sess_list_search(&w.sessions, 5, &same_iqn, same_name), s);
     EXPECT_EQ(iscsi_sess_list_search(&w.sessions, 6, w.target, w.a), nullptr);
     EXPECT_EQ(iscsi_sess_list_search(&w.sessions, 5, w.target, w.b), nullptr);
 
     iscsi_sess_t *twin = iscsi_sess_new();
     twin->sid = 5;
-    twin->target = same_iqn;
+    twin->target = &same_iqn;
     twin->initiator = same_name;
     EXPECT_EQ(iscsi_sess_list_add_node(&w.sessions, twin), -2);
     EXPECT_EQ(iscsi_sess_list_add_node(nullptr, twin), ERR_PARAM);
@@ -83,7 +77,6 @@ TEST(Sess, SameSessionIsSameIdTargetIqnAndInitiatorName)
     EXPECT_EQ(iscsi_sess_list_add_node(&w.sessions, twin), 0);
     EXPECT_EQ(iscsi_sess_list_add(&w.sessions, 7, nullptr, 3, w.target, w.a), nullptr);
     iscsi_initiator_free(same_name);
-    iscsi_target_free(same_iqn);
 }
 
 // Which connections are the same, with texts: sessions/connections.txt.
