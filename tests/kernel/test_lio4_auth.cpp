@@ -17,7 +17,6 @@ TEST_F(Lio4Test, ChapPasswordLengthAndMutualOnlyWithOneWay)
         {1, 0, "user", "twelve-chars", "", "", 1},
         {1, 0, "user", "sixteen-chars-xx", "", "", 1},
         {1, 0, "user", "seventeen-chars-x", "", "", 0},
-        {1, 0, "user", "", "", "", 0},
         {1, 0, "", "twelve-chars", "", "", 0},
         {1, 1, "user", "twelve-chars", "muser", "short", 0},
         {1, 1, "user", "twelve-chars", "muser", "sixteen-chars-xx", 1},

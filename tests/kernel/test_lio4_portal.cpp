@@ -33,8 +33,6 @@ TEST_F(Lio4Test, PortalNamesParse)
             EXPECT_EQ(port, c.port);
         }
     }
-    EXPECT_EQ(_check_np_ip_type("10.0.0.1:3260"), IP_TYPE_V4);
-    EXPECT_EQ(_check_np_ip_type("[::1]:3260"), IP_TYPE_V6);
 }
 
 TEST_F(Lio4Test, WantedPortalsThatWouldLeaveTheirDirectoryAreRefusedWhole)

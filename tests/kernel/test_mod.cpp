@@ -27,7 +27,6 @@ TEST_F(ModTest, SelectAcceptsOnlyTheLioTypeAndWithoutATableEachWrapperAnswersIts
     EXPECT_EQ(iscsi_mod_stop(), ERR_MODULE_START);
     EXPECT_EQ(iscsi_mod_get_state(), 1);
     EXPECT_EQ(iscsi_mod_add_target(&target), ERR_PARAM);
-    EXPECT_EQ(iscsi_mod_get_target_ip_list(&list_, &target), ERR_PARAM);
     EXPECT_EQ(iscsi_mod_del_backstore(&lun), ERR_MODULE_START);
     EXPECT_EQ(iscsi_mod_get_target_ip_list_in_target_parm(&list_, IQN, 1), ERR_PARAM);
     ASSERT_EQ(iscsi_mod_select(ISCSI_MOD_TYPE_LIO), 0);
@@ -106,7 +105,6 @@ TEST_F(ModTest, RecordsTargetsByIqnInitiatorsByExactNameAndWhatTheirFreeReleases
     set(t1x.iqn, std::string(IQN) + "x");
     EXPECT_EQ(iscsi_target_cmp(&target, &t1b), 1) << "the portal group takes no part";
     EXPECT_EQ(iscsi_target_cmp(&target, &t1x), 0);
-    EXPECT_EQ(iscsi_target_cmp(&t1x, &target), 0);
     EXPECT_EQ(iscsi_target_cmp(&empty, &empty), 0);
     EXPECT_EQ(iscsi_target_cmp(&target, nullptr), 0);
 }
