@@ -3,6 +3,7 @@
 // configuration context and the stored debug level.
 #include <cstdlib>
 #include <cstring>
+#include <utility>
 
 #include "common/korvadm_debug.h"
 #include "tests/config/store_fixture.h"
@@ -32,15 +33,12 @@ TEST(Records, StartUnknownAndFreeingUnlinks)
 TEST(AccessRight, WordsMatchByPrefixIgnoringCaseUpToTenCharacters)
 {
     const std::string long_word(4096, 'R');
-    const struct {
-        const char *text;
-        int want;
-    } cases[] = {{"deny", 0},         {"DENYALL", 0},     {"ro", 1},      {"Rox", 1},        {"ROOT", 1},
-                 {"Rw", 2},           {"RW34567890", 2},  {"READ", -1},   {"DEN", -1},       {"R", -1},
-                 {"", -1},            {nullptr, -1},      {"RW345678901", -1}, {"deny567890x", -1},
-                 {long_word.c_str(), -1}};
-    for (const auto &c : cases)
-        EXPECT_EQ(iscsi_conf_parse_access_right(c.text), c.want) << (c.text ? c.text : "(null)");
+    const std::pair<const char *, int> cases[] = {
+        {"deny", 0}, {"DENYALL", 0}, {"ro", 1}, {"Rox", 1}, {"ROOT", 1}, {"Rw", 2},
+        {"RW34567890", 2}, {"READ", -1}, {"DEN", -1}, {"R", -1}, {"", -1}, {nullptr, -1}, {"RW345678901", -1},
+        {"deny567890x", -1}, {long_word.c_str(), -1}};
+    for (const auto &[text, want] : cases)
+        EXPECT_EQ(iscsi_conf_parse_access_right(text), want) << (text ? text : "(null)");
 }
 
 using ConfContext = StoreTest;

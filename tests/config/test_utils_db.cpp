@@ -4,6 +4,7 @@
 #include <cstdlib>
 #include <cstring>
 #include <cerrno>
+#include <tuple>
 
 #include "config/korvadm_utils_db.h"
 #include "tests/config/store_fixture.h"
@@ -15,15 +16,12 @@ using TypedAccess = LoadedStore<kTyped>;
 
 TEST_F(TypedAccess, IntegerReadsFollowAtoiButRefuseEmptyOrAbsent)
 {
-    const struct {
-        const char *path;
-        int rc;
-        int32_t value;
-    } cases[] = {{"/t/empty", ERR_INT_VALUE, 0}, {"/t/absent", ERR_INT_VALUE, 0}, {"/t/mixed", KORV_OK, 12},
-                 {"/t/word", KORV_OK, 0}, {"/t/neg", KORV_OK, -42}};
+    const std::tuple<const char *, int, int32_t> cases[] = {
+        {"/t/empty", ERR_INT_VALUE, 0}, {"/t/absent", ERR_INT_VALUE, 0}, {"/t/mixed", KORV_OK, 12},
+        {"/t/word", KORV_OK, 0},        {"/t/neg", KORV_OK, -42}};
     int32_t v = 77;
-    for (const auto &c : cases)
-        EXPECT_EQ(slash(xmldb_get_int32_t(&v, c.path), v), slash(c.rc, c.value)) << c.path;
+    for (const auto &[path, rc, value] : cases)
+        EXPECT_EQ(slash(xmldb_get_int32_t(&v, path), v), slash(rc, value)) << path;
     // The reader's own buffer is 128 bytes: a long number (data/typed.xml) is cut, not overrun.
     EXPECT_EQ(xmldb_get_int32_t(&v, "/t/long"), KORV_OK);
     EXPECT_EQ(xmldb_get_int32_t(&v, ""), ERR_PARAM);
@@ -84,11 +82,7 @@ TEST(Converters, AcceptTrailingTextAndReportFailuresOnStandardError)
     static long l;
     static uint64_t u;
     const std::string none = "No digits were found\n", range = "strtoll: " + std::string(std::strerror(ERANGE)) + "\n";
-    const struct {
-        std::string (*call)();
-        const char *want;
-        std::string err;
-    } cases[] = {
+    const std::tuple<std::string (*)(), const char *, std::string> cases[] = {
         {[] { return slash(convert_dec_str_to_l("0x10", &end, &l), l, end); }, "0/0/x10", {}},
         {[] { return slash(convert_hex_str_to_l("ff", nullptr, &l), l); }, "0/255", {}},
         {[] { return slash(convert_dec_str_to_uint64_t("  123kb", &end, &u), u, end); }, "0/123/kb", {}},
@@ -108,10 +102,11 @@ TEST(Converters, AcceptTrailingTextAndReportFailuresOnStandardError)
          },
          "1/0", range},
     };
-    for (const auto &c : cases) {
+    for (const auto &[call, want, err] : cases) {
         std::string got;
-        EXPECT_EQ(capture_stderr([&] { got = c.call(); }), c.err) << c.want;
-        EXPECT_EQ(got, c.want);
+        auto run = call;  // clang 14 cannot capture a structured binding
+        EXPECT_EQ(capture_stderr([&] { got = run(); }), err) << want;
+        EXPECT_EQ(got, want);
     }
     EXPECT_EQ(logged([] { return convert_dec_str_to_l(nullptr, &end, &l); }, "ERR_PARAM_ERROR"), ERR_PARAM);
     EXPECT_EQ(quiet([] { return convert_hex_str_to_l("1", &end, nullptr); }), ERR_PARAM);

@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 // LUNs: add, the field operations by name and the record readers.
 #include <cstring>
+#include <utility>
 
 #include "tests/config/store_fixture.h"
 
@@ -19,10 +20,7 @@ TEST_F(Luns, AddWritesEveryFieldWithSector512AndVolumeState1)
 
 TEST_F(Luns, AddRefusesInvalidRecordsBeforeAnyWrite)
 {
-    const struct {
-        const char *message;
-        void (*spoil)(lun_conf_t *);
-    } cases[] = {
+    const std::pair<const char *, void (*)(lun_conf_t *)> cases[] = {
         {"name is empty", [](lun_conf_t *l) { l->name[0] = '\0'; }},
         {"name is too long", [](lun_conf_t *l) { std::memset(l->name, 'n', sizeof l->name); }},
         {"volume uuid is empty", [](lun_conf_t *l) { l->uuid[0] = '\0'; }},
@@ -30,10 +28,10 @@ TEST_F(Luns, AddRefusesInvalidRecordsBeforeAnyWrite)
         {"size is not given", [](lun_conf_t *l) { l->size = 0; }},
         {"prealloc is wrong", [](lun_conf_t *l) { l->prealloc = 2; }},
     };
-    for (const auto &c : cases) {
+    for (const auto &[message, spoil] : cases) {
         lun_ptr l = new_lun("bad");
-        c.spoil(l.get());
-        EXPECT_EQ(logged([&] { return xmldb_add_new_lun(l.get()); }, c.message), ERR_PARAM);
+        spoil(l.get());
+        EXPECT_EQ(logged([&] { return xmldb_add_new_lun(l.get()); }, message), ERR_PARAM);
     }
     EXPECT_EQ(raw(lpath(1, "name")) + raw("/iscsi/lun/count"), "");
 }

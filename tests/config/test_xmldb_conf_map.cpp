@@ -5,6 +5,8 @@
 #include <sys/un.h>
 #include <unistd.h>
 
+#include <tuple>
+
 #include "tests/config/store_fixture.h"
 
 using namespace korv_test;
@@ -114,26 +116,22 @@ TEST_F(Mapping, AFailedWriteTakesBackTheNewMapEntryAndTheLunsTargetName)
     db().stop();
     const char *real_sock = "/var/run/xmldb_real";
     XmldbProcess real(SysRoot::file(real_sock), {"--load", data_file("mapped_one.xml")});
-    const struct {
-        int refuse;
-        const char *message;
-        const char *left;  // what the real service holds afterwards
-    } rows[] = {
+    // The set request refused, its message, what the real service holds afterwards.
+    const std::tuple<int, const char *, const char *> rows[] = {
         {1, "set /iscsi/target/id:1/map_lun/id:2/lun_name = l1 failed", "map_rolled_back.txt"},
         {2, "set /iscsi/target/id:1/map_lun/id:2/lun_num = 7 failed", "map_rolled_back.txt"},
         {3, "set /iscsi/lun/id:1/target_name = t1 failed", "map_rolled_back.txt"},
         {4, "set /iscsi/lun/id:1/lun_num = 7 failed", "map_rolled_back.txt"},
         {5, "set LUN count = 2 failed", "map_rolled_back_count.txt"},
     };
-    for (const auto &r : rows) {
+    for (const auto &[refuse, message, left] : rows) {
         real.stop();
         real.start();  // t1 maps l2 as number 0: l1 goes to map entry 2
         {
-            RefusingProxy proxy(SysRoot::file(real_sock), r.refuse);
-            EXPECT_EQ(logged([] { return xmldb_add_target_lun_map("t1", "l1", 7); }, r.message), ERR_DB_WRITE);
+            RefusingProxy proxy(SysRoot::file(real_sock), refuse);
+            EXPECT_EQ(logged([] { return xmldb_add_target_lun_map("t1", "l1", 7); }, message), ERR_DB_WRITE);
         }
         // Entry 1 and the LUN it maps stay; entry 2 and l1's target name go.
-        EXPECT_EQ(dump("/iscsi", real_sock), data(r.left))
-            << r.refuse;
+        EXPECT_EQ(dump("/iscsi", real_sock), data(left)) << refuse;
     }
 }

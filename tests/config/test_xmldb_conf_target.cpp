@@ -2,6 +2,7 @@
 // Targets: add, the field operations by name, connection records, and the
 // record readers.
 #include <cstring>
+#include <utility>
 
 #include "tests/config/store_fixture.h"
 
@@ -23,10 +24,7 @@ TEST_F(Targets, AddWritesEveryFieldButCredentialsOnlyWithChapOn)
 
 TEST_F(Targets, AddRefusesInvalidRecordsBeforeAnyWrite)
 {
-    const struct {
-        const char *message;
-        void (*spoil)(target_conf_t *);
-    } cases[] = {
+    const std::pair<const char *, void (*)(target_conf_t *)> cases[] = {
         {"target_suffix error", [](target_conf_t *t) { t->name[0] = '\0'; }},
         // 128 characters leave no room for the terminator: every reader would cut it.
         {"target_suffix error", [](target_conf_t *t) { std::memset(t->name, 'n', sizeof t->name); }},
@@ -37,10 +35,10 @@ TEST_F(Targets, AddRefusesInvalidRecordsBeforeAnyWrite)
         {"chap_name error", [](target_conf_t *t) { t->chap_enable = 1; t->chap_name[0] = '\0'; }},
         {"chap_password error", [](target_conf_t *t) { t->chap_enable = 1; t->chap_pwd[0] = '\0'; }},
     };
-    for (const auto &c : cases) {
+    for (const auto &[message, spoil] : cases) {
         target_ptr t = new_target("bad");
-        c.spoil(t.get());
-        EXPECT_EQ(logged([&] { return xmldb_add_new_target(t.get()); }, c.message), ERR_PARAM);
+        spoil(t.get());
+        EXPECT_EQ(logged([&] { return xmldb_add_new_target(t.get()); }, message), ERR_PARAM);
     }
     EXPECT_EQ(raw(tpath(1, "name")) + raw("/iscsi/target/count"), "");
     EXPECT_EQ(quiet([&] { return xmldb_add_new_target(nullptr); }), ERR_PARAM);
