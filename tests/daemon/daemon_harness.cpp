@@ -6,8 +6,6 @@
 #include <unistd.h>
 
 #include <cstdlib>
-#include <fstream>
-#include <iterator>
 #include <sstream>
 
 #include <gtest/gtest.h>
@@ -82,20 +80,16 @@ daemon_process::daemon_process(const std::string &binary, const std::string &ser
     close(fd);
     log_ = tmpl;
     // Nothing of ours (the database client's connection) goes to the daemon.
-    proc_.start({binary, server}, log_, [] { close_range(3, ~0U, 0); });
+    start({binary, server}, log_, [] { close_range(3, ~0U, 0); });
 }
 
 daemon_process::~daemon_process()
 {
-    proc_.kill();
+    kill();
     unlink(log_.c_str());
 }
 
-std::string daemon_process::output() const
-{
-    std::ifstream in(log_);
-    return {std::istreambuf_iterator<char>(in), {}};
-}
+std::string daemon_process::output() const { return SysRootTest::read_file(log_); }
 
 int daemon_process::count(const std::string &text) const
 {
@@ -114,7 +108,7 @@ bool daemon_process::wait_for(const std::string &text, std::chrono::milliseconds
 bool daemon_process::idle() const
 {
     // "<number> <arguments...>" while blocked in a system call, "running" otherwise.
-    std::ifstream in("/proc/" + std::to_string(pid()) + "/syscall");
+    std::istringstream in(SysRootTest::read_file("/proc/" + std::to_string(pid()) + "/syscall"));
     long nr = -1;
     std::string fds, nfds;
     return in >> nr >> fds >> nfds && nr == SYS_ppoll && nfds == "0x0";

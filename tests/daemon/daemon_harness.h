@@ -6,8 +6,6 @@
 // parts against the real root.
 #pragma once
 
-#include <sys/types.h>
-
 #include <set>
 #include <string>
 #include <vector>
@@ -39,10 +37,7 @@ void set_host_name(const std::string &name);
 void store_targets(const std::string &entity_id, const std::vector<target_spec> &targets);
 
 // prefix + entity_id + ":" + target.
-inline std::string target_iqn(const std::string &entity_id, const std::string &target)
-{
-    return kPrefix + entity_id + ":" + target;
-}
+inline std::string target_iqn(const std::string &eid, const std::string &name) { return kPrefix + eid + ":" + name; }
 
 // The stored daemon pid ("/system_mgr/iscsi/iSNS/pid"); -1 when unreadable.
 long long stored_pid();
@@ -56,17 +51,14 @@ inline constexpr int kTestInterval = 2;
 // The values of attribute `key` in `isnsadm --list <what>` (quotes stripped).
 std::set<std::string> isnsadm_rows(const isnsd_server &srv, const std::string &what, const std::string &key);
 
-class daemon_process {
+// The daemon as a child process (pid(), signal(), wait() for its exit status)
+// with its standard output and error in a file.
+class daemon_process : public child_process {
 public:
-    // Runs `binary server` with stdout and stderr in a file; env as ours.
+    // Runs `binary server`; env as ours.
     daemon_process(const std::string &binary, const std::string &server);
     ~daemon_process();  // SIGKILLs a daemon still running
 
-    pid_t pid() const { return proc_.pid(); }
-    void signal(int sig) const { proc_.signal(sig); }
-    // Exit status (or 128+signal) when the process ends within the time; -1
-    // when it is still running then.
-    int wait_exit(std::chrono::milliseconds limit) { return proc_.wait(limit); }
     // Everything the daemon printed so far.
     std::string output() const;
     // Occurrences of `text` in the output.
@@ -78,7 +70,6 @@ public:
     bool idle() const;
 
 private:
-    child_process proc_;
     std::string log_;
 };
 

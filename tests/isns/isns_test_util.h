@@ -61,8 +61,7 @@ inline bytes status_rsp(uint32_t status, uint16_t func = 0x8002)
 // the client pointed at it with `source` as the source name.
 inline std::unique_ptr<isns_fake_server> fake_at(const char *address, isns_fake_reply reply, const char *source = "")
 {
-    auto srv = std::make_unique<isns_fake_server>(address);
-    srv->set_reply(std::move(reply));
+    auto srv = std::make_unique<isns_fake_server>(address, reply);
     reset_client(address, AF_INET, source);
     return srv;
 }

@@ -7,6 +7,7 @@
 #include <fstream>
 
 #include "tests/support/isns_test_server.h"
+#include "tests/support/sysroot.h"
 
 namespace korv_test {
 
@@ -30,8 +31,7 @@ isnsd_server::~isnsd_server()
 {
     stop();
     std::error_code ignored;
-    if (!dir_.empty())
-        std::filesystem::remove_all(dir_, ignored);
+    std::filesystem::remove_all(dir_, ignored);
 }
 
 bool isnsd_server::start()
@@ -61,9 +61,8 @@ bool isnsd_server::start()
     }, std::chrono::seconds(5));
     if (up && proc_.running())
         return true;
-    std::ifstream in(log);
     error_ = (up ? "isnsd exited at start: " : "isnsd did not accept connections within 5 s: ") +
-             std::string(std::istreambuf_iterator<char>(in), {});
+             SysRootTest::read_file(log);
     stop();
     return false;
 }

@@ -32,15 +32,16 @@ socklen_t make_addr(const std::string &address, int port, sockaddr_storage *ss)
 
 }  // namespace
 
-isns_fake_server::isns_fake_server(const std::string &address, int port)
+isns_fake_server::isns_fake_server(const std::string &address, isns_fake_handler handler)
+    : handler_(std::move(handler))
 {
     sockaddr_storage ss{};
-    const socklen_t len = make_addr(address, port, &ss);
+    const socklen_t len = make_addr(address, 3205, &ss);
     const int fd = len ? socket(ss.ss_family, SOCK_STREAM | SOCK_CLOEXEC, 0) : -1;
     int one = 1;
     setsockopt(fd, SOL_SOCKET, SO_REUSEADDR, &one, sizeof one);
     if (fd < 0 || bind(fd, reinterpret_cast<sockaddr *>(&ss), len) != 0 || listen(fd, 8) != 0) {
-        ADD_FAILURE() << "cannot listen on " << address << ":" << port << ": " << std::strerror(errno);
+        ADD_FAILURE() << "cannot listen on " << address << ":3205: " << std::strerror(errno);
         close(fd);
         return;
     }
@@ -54,12 +55,6 @@ isns_fake_server::~isns_fake_server()
     if (thread_.joinable())
         thread_.join();
     close(listen_fd_);
-}
-
-void isns_fake_server::set_handler(std::function<isns_fake_reply(const bytes &)> handler)
-{
-    std::lock_guard<std::mutex> lock(mu_);
-    handler_ = std::move(handler);
 }
 
 std::vector<bytes> isns_fake_server::requests() const
@@ -102,13 +97,11 @@ void isns_fake_server::serve_one(int fd)
         if (req.size() == 12)
             want = 12 + ((size_t{req[4]} << 8) | req[5]);
     }
-    std::function<isns_fake_reply(const bytes &)> handler;
     {
         std::lock_guard<std::mutex> lock(mu_);
         requests_.push_back(req);
-        handler = handler_;
     }
-    const isns_fake_reply reply = handler ? handler(req) : isns_fake_reply{};
+    const isns_fake_reply reply = handler_(req);
     const size_t step = reply.chunk ? reply.chunk : reply.data.size();
     for (size_t off = 0; off < reply.data.size(); off += step) {
         if (off)
@@ -122,8 +115,7 @@ void isns_fake_server::serve_one(int fd)
 
 bytes be32(uint32_t v)
 {
-    return {static_cast<uint8_t>(v >> 24), static_cast<uint8_t>(v >> 16), static_cast<uint8_t>(v >> 8),
-            static_cast<uint8_t>(v)};
+    return {uint8_t(v >> 24), uint8_t(v >> 16), uint8_t(v >> 8), uint8_t(v)};
 }
 
 // Version 1 and the function id, then the length and the flags, then the

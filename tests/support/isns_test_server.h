@@ -2,7 +2,7 @@
 // A scriptable iSNS server for tests: faults a real server will not produce.
 //
 // isns_fake_server listens on one loopback address (IPv4 or IPv6 text) and
-// port (3205 by default) and serves connections one at a time on its own
+// port 3205 and serves connections one at a time on its own
 // thread. For each connection it reads one request PDU (header and payload),
 // records it, asks its handler for the reply and plays it: the bytes at once
 // or in timed chunks (a trickling server), then keeps the connection open for
@@ -33,19 +33,18 @@ struct isns_fake_reply {
     int hold_ms = 0;       // stays connected (silent) this long before closing
 };
 
+// A reply computed from the request received (whole PDU bytes).
+using isns_fake_handler = std::function<isns_fake_reply(const bytes &request)>;
+
 class isns_fake_server {
 public:
-    // Binds address:port; a test failure says why it cannot.
-    explicit isns_fake_server(const std::string &address, int port = 3205);
+    // Binds address, port 3205 (a test failure says why it cannot), and
+    // answers every connection with what the handler computes ...
+    isns_fake_server(const std::string &address, isns_fake_handler handler);
+    // ... or with one reply for all.
+    isns_fake_server(const std::string &address, const isns_fake_reply &reply)
+        : isns_fake_server(address, [reply](const bytes &) { return reply; }) {}
     ~isns_fake_server();
-
-    // Every connection gets this reply (default: none, close at once).
-    void set_reply(isns_fake_reply reply)
-    {
-        set_handler([reply](const bytes &) { return reply; });
-    }
-    // Or a reply computed from the request received (whole PDU bytes).
-    void set_handler(std::function<isns_fake_reply(const bytes &request)> handler);
 
     // Requests received so far, whole PDUs.
     std::vector<bytes> requests() const;
@@ -59,8 +58,8 @@ private:
 
     int listen_fd_ = -1;
     std::atomic<bool> stop_{false};
+    const isns_fake_handler handler_;
     mutable std::mutex mu_;
-    std::function<isns_fake_reply(const bytes &)> handler_;
     std::vector<bytes> requests_;
     std::thread thread_;
 };

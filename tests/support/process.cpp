@@ -30,8 +30,7 @@ bool child_process::start(const std::function<int()> &body)
     return pid > 0;
 }
 
-bool child_process::start(std::vector<std::string> argv, const std::string &log,
-                          const std::function<void()> &prepare)
+bool child_process::start(std::vector<std::string> argv, const std::string &log, const std::function<void()> &prepare)
 {
     return start([&] {
         const int fd = log.empty() ? -1 : ::open(log.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0600);

@@ -37,8 +37,7 @@ public:
     bool start(const std::function<int()> &body);
     // Executes argv[0] with argv; `prepare` runs in the child just before
     // (redirections); log, when given, receives standard output and error.
-    bool start(std::vector<std::string> argv, const std::string &log = {},
-               const std::function<void()> &prepare = {});
+    bool start(std::vector<std::string> argv, const std::string &log = {}, const std::function<void()> &prepare = {});
     // The exit status (128+N when killed by signal N) once the process has
     // ended within the limit; -1 when it is still running then, or was not.
     int wait(std::chrono::milliseconds limit);

@@ -21,20 +21,6 @@ namespace {
 pid_t g_root_owner = 0;
 std::error_code ec_ignored;  // a test's files may already be gone
 
-void mkdirs_at(const std::string &path) { fs::create_directories(path, ec_ignored); }
-
-void write_at(const std::string &path, const std::string &text)
-{
-    mkdirs_at(fs::path(path).parent_path());
-    std::ofstream(path, std::ios::binary | std::ios::trunc) << text;
-}
-
-std::string read_at(const std::string &path)
-{
-    std::ifstream in(path, std::ios::binary);
-    return {std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>()};
-}
-
 void remove_root_at_exit()
 {
     // Forked children exit through here too: only the creator cleans up.
@@ -67,9 +53,9 @@ const std::string &SysRoot::path()
 }
 
 std::string SysRoot::file(const std::string &abs) { return path() + abs; }
-void SysRoot::write(const std::string &abs, const std::string &content) { write_at(file(abs), content); }
-std::string SysRoot::read(const std::string &abs) { return read_at(file(abs)); }
-void SysRoot::mkdirs(const std::string &abs) { mkdirs_at(file(abs)); }
+void SysRoot::write(const std::string &abs, const std::string &content) { SysRootTest::write_file(file(abs), content); }
+std::string SysRoot::read(const std::string &abs) { return SysRootTest::read_file(file(abs)); }
+void SysRoot::mkdirs(const std::string &abs) { SysRootTest::mkdirs(file(abs)); }
 void SysRoot::remove(const std::string &abs) { fs::remove_all(file(abs), ec_ignored); }
 
 void SysRootTest::SetUp()
@@ -79,9 +65,20 @@ void SysRootTest::SetUp()
     g_korv_debug_level = 0;
 }
 
-void SysRootTest::mkdirs(const std::string &path) { mkdirs_at(path); }
-void SysRootTest::write_file(const std::string &path, const std::string &text) { write_at(path, text); }
-std::string SysRootTest::read_file(const std::string &path) { return read_at(path); }
+void SysRootTest::mkdirs(const std::string &path) { fs::create_directories(path, ec_ignored); }
+
+void SysRootTest::write_file(const std::string &path, const std::string &text)
+{
+    mkdirs(fs::path(path).parent_path());
+    std::ofstream(path, std::ios::binary | std::ios::trunc) << text;
+}
+
+std::string SysRootTest::read_file(const std::string &path)
+{
+    std::ifstream in(path, std::ios::binary);
+    return {std::istreambuf_iterator<char>(in), {}};
+}
+
 bool SysRootTest::exists(const std::string &path) { return fs::exists(fs::symlink_status(path, ec_ignored)); }
 
 }  // namespace korv_test

@@ -39,9 +39,11 @@ protected:
 
     static const std::string &root() { return SysRoot::path(); }
     static std::string at(const std::string &abs) { return SysRoot::file(abs); }
-    // On real paths: directories with their parents; a file with its parents;
-    // a file's contents ("" when unreadable); existence (links count,
-    // dangling or not).
+
+public:
+    // On real paths (any, also outside the root): directories with their
+    // parents; a file with its parents; a file's contents ("" when
+    // unreadable); existence (links count, dangling or not).
     static void mkdirs(const std::string &path);
     static void write_file(const std::string &path, const std::string &text);
     static std::string read_file(const std::string &path);

@@ -30,9 +30,7 @@ inline constexpr bool kWithSysinfo = true;
 class XmldbProcess {
 public:
     explicit XmldbProcess(std::string socket, std::vector<std::string> options = {"--empty"})
-        : socket_(std::move(socket)), options_(std::move(options))
-    {
-    }
+        : socket_(std::move(socket)), options_(std::move(options)) {}
     ~XmldbProcess();
 
     // Starts the service (no-op when running); returns when it is serving.
