@@ -24,18 +24,15 @@ void set_host_name(const std::string &name) { SysRoot::write("/proc/sys/kernel/h
 
 void store_targets(const std::string &entity_id, const std::vector<target_spec> &targets)
 {
+    // The reader's walk ends only at an entry without a name: nothing an
+    // earlier call stored may stay beyond the list.
+    ASSERT_EQ(0, dbDelete("/iscsi/target"));
     ASSERT_EQ(0, dbSetStr(kPrefix, "/iscsi/target/iqn_prefix"));
     ASSERT_EQ(0, dbSetLL(1, "/iscsi/target/dbg"));
-    // The reader's walk ends only at an entry without a name: clear what an
-    // earlier call may have stored beyond the list.
-    for (size_t i = 1; i <= 64; ++i)
-        dbDelete(("/iscsi/target/id:" + std::to_string(i)).c_str());
     for (size_t i = 0; i < targets.size(); ++i) {
         std::string base = "/iscsi/target/id:" + std::to_string(i + 1) + "/";
         ASSERT_EQ(0, dbSetStr(targets[i].name.c_str(), (base + "name").c_str()));
-        if (targets[i].tpgt >= 0) {
-            ASSERT_EQ(0, dbSetLL(targets[i].tpgt, (base + "tpgt").c_str()));
-        }
+        ASSERT_EQ(0, dbSetLL(targets[i].tpgt, (base + "tpgt").c_str()));
     }
     ASSERT_EQ(0, dbSetLL(static_cast<long long>(targets.size()), "/iscsi/target/count"));
 
@@ -50,14 +47,11 @@ void store_targets(const std::string &entity_id, const std::vector<target_spec> 
 
 long long stored_pid()
 {
-    char buf[32] = {};
-    if (dbGetStr(buf, sizeof buf, "/system_mgr/iscsi/iSNS/pid") != 0)
-        return -1;
-    return std::atoll(buf);
+    int rc = 0;
+    const std::string pid = xmldb_get("/system_mgr/iscsi/iSNS/pid", &rc);
+    return rc < 0 ? -1 : std::atoll(pid.c_str());
 }
 
-std::string nesrad_binary() { return NESRAD_BIN; }
-std::string nesrad_test_binary() { return NESRAD_TEST_BIN; }
 
 std::set<std::string> isnsadm_rows(const isnsd_server &srv, const std::string &what, const std::string &key)
 {

@@ -21,7 +21,7 @@ inline constexpr const char *kPrefix = "iqn.2026-01.org.example:";
 
 struct target_spec {
     std::string name;
-    int tpgt = 1;  // < 0: stored without "tpgt"
+    int tpgt = 1;
     // np/ entries as the kernel names them
     std::vector<std::string> portals{"192.0.2.10:3260", "[2001:db8::10]:3260"};
     bool in_kernel = true;  // false: no configfs directory at all
@@ -43,10 +43,10 @@ inline std::string target_iqn(const std::string &eid, const std::string &name) {
 long long stored_pid();
 
 // The installed daemon and the test-only one (same loop, short interval).
-std::string nesrad_binary();
-std::string nesrad_test_binary();
+inline std::string nesrad_binary() { return NESRAD_BIN; }
+inline std::string nesrad_test_binary() { return NESRAD_TEST_BIN; }
 // Interval of the test-only daemon, seconds.
-inline constexpr int kTestInterval = 2;
+inline constexpr int kTestInterval = NESRAD_TEST_INTERVAL;
 
 // The values of attribute `key` in `isnsadm --list <what>` (quotes stripped).
 std::set<std::string> isnsadm_rows(const isnsd_server &srv, const std::string &what, const std::string &key);

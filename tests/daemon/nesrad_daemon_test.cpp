@@ -120,22 +120,19 @@ TEST_F(Appliance, StartUpFailuresExitWithTheirStatusAndMessages)
     // The database gone: asked again once a second for 10 s, then 255. (A
     // broken record alone does not fail the read: the store skips it.)
     db_.stop();
-    {
-        daemon_process d(nesrad_test_binary(), "127.20.1.2");
-        EXPECT_EQ(255, d.wait(20s));
-        EXPECT_GE(d.count("get target conf from config failed"), 1) << d.output();
-        EXPECT_NEAR(10, d.count("configuration service not answering"), 1) << d.output();
-    }
+    daemon_process no_db(nesrad_test_binary(), "127.20.1.2");
+    EXPECT_EQ(255, no_db.wait(20s));
+    EXPECT_GE(no_db.count("get target conf from config failed"), 1) << no_db.output();
+    EXPECT_NEAR(10, no_db.count("configuration service not answering"), 1) << no_db.output();
     db_.restart();
 
     // The installed daemon's host lookup (also when linked statically).
-    // Without targets nothing goes to that server; the daemon is killed.
+    // Without targets nothing goes to that server.
     store_targets(kEid, {});
-    {
-        daemon_process d(nesrad_binary(), "localhost");
-        ASSERT_TRUE(d.wait_for("resolve address as ", 5s)) << d.output();
-        EXPECT_EQ(1, d.count("resolve address as 127.0.0.1\n") + d.count("resolve address as ::1\n")) << d.output();
-    }
+    daemon_process local(nesrad_binary(), "localhost");
+    ASSERT_TRUE(local.wait_for("resolve address as ", 5s)) << local.output();
+    EXPECT_EQ(1, local.count("resolve address as 127.0.0.1\n") + local.count("resolve address as ::1\n"))
+        << local.output();
     SysRoot::remove("/proc/sys/kernel/hostname");
     daemon_process d(nesrad_binary(), "127.20.1.1");
     EXPECT_EQ(1, d.wait(5s));
@@ -203,17 +200,16 @@ TEST_F(Appliance, EverythingHangsOnTheFirstTarget)
     std::vector<target_spec> targets = kThreeTargets;
     targets[0].in_kernel = false;
     store_targets(kEid, targets);
-    {
-        // Its portals cannot be listed: no entity, and the further nodes go
-        // out with an empty source, which the server refuses. Judged once the
-        // pass is over (the daemon back in its wait), which the installed
-        // daemon's minute keeps clear of the next check's clean-up.
-        daemon_process d(nesrad_binary(), "127.20.2.3");
-        ASSERT_TRUE(d.wait_for("register iqn=" + target_iqn(kEid, "t3"), 5s)) << d.output();
-        ASSERT_TRUE(eventually([&] { return d.idle(); }, 10s)) << d.output();
-        EXPECT_GE(d.count("can not get target ip"), 1) << d.output();
-        EXPECT_TRUE(entity_ids(*srv_).empty()) << srv_->adm("--list nodes");
-    }
+    // Its portals cannot be listed: no entity, and the further nodes go
+    // out with an empty source, which the server refuses. Judged once the
+    // pass is over (the daemon back in its wait), which the installed
+    // daemon's minute keeps clear of the next check's clean-up.
+    daemon_process first(nesrad_binary(), "127.20.2.3");
+    ASSERT_TRUE(first.wait_for("register iqn=" + target_iqn(kEid, "t3"), 5s)) << first.output();
+    ASSERT_TRUE(eventually([&] { return first.idle(); }, 10s)) << first.output();
+    EXPECT_GE(first.count("can not get target ip"), 1) << first.output();
+    EXPECT_TRUE(entity_ids(*srv_).empty()) << srv_->adm("--list nodes");
+    first.kill();
     // It has no portals: the node type is dropped, so the check keyed on
     // type Target never finds the entity's node and registers again each time.
     targets[0] = {"t1", 1, {}};

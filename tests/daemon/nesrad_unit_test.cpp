@@ -22,13 +22,9 @@ std::vector<std::string> listed()
     return out;
 }
 
-struct NodeList : ::testing::Test {
-    void TearDown() override { _iqn_clear(); }
-};
-
 }  // namespace
 
-TEST_F(NodeList, KeepsOrderAndDuplicatesAndDeletesTheFirstMatch)
+TEST(NodeList, KeepsOrderAndDuplicatesAndDeletesTheFirstMatch)
 {
     nesrad_node_t *rec = nullptr;
     EXPECT_EQ(-1, _iqn_next(nullptr, &rec)) << "empty list has no head";
@@ -80,7 +76,7 @@ TEST(CheckInterval, AShortRegistrationPeriodIsCheckedAtTwoThirdsOfIt)
         EXPECT_EQ(c.ms, nesrad_check_interval_ms(60, c.period)) << c.period;
 }
 
-TEST_F(NodeList, FollowsTheStoreAndKeepsTheIdentifierWithoutAHostName)
+TEST(NodeList, FollowsTheStoreAndKeepsTheIdentifierWithoutAHostName)
 {
     set_host_name("NAS_Box1");
     XmldbService db;
@@ -101,4 +97,5 @@ TEST_F(NodeList, FollowsTheStoreAndKeepsTheIdentifierWithoutAHostName)
     store_targets("nas-box1", {{"t1", 1}});
     EXPECT_EQ(1, init_iqn_list());
     EXPECT_EQ((std::vector<std::string>{target_iqn("kept", "t1") + "/1"}), listed());
+    _iqn_clear();
 }

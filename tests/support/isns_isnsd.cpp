@@ -21,10 +21,7 @@ isnsd_server::isnsd_server(std::string address, int registration_period)
     : address_(std::move(address)), period_(registration_period)
 {
     char tmpl[] = "/tmp/korv-isnsd-XXXXXX";
-    if (mkdtemp(tmpl))
-        dir_ = tmpl;
-    else
-        error_ = "mkdtemp failed";
+    dir_ = mkdtemp(tmpl) ? tmpl : "";
 }
 
 isnsd_server::~isnsd_server()
@@ -36,10 +33,10 @@ isnsd_server::~isnsd_server()
 
 bool isnsd_server::start()
 {
-    if (dir_.empty() || proc_.pid() > 0)
-        return !dir_.empty();
-    if (tcp_port_open(address_, 3205)) {
-        error_ = "port 3205 on " + address_ + " is already held by another server";
+    if (proc_.pid() > 0)
+        return true;
+    if (dir_.empty() || tcp_port_open(address_, 3205)) {
+        error_ = dir_.empty() ? "mkdtemp failed" : "port 3205 on " + address_ + " is already held by another server";
         return false;
     }
     const bool v6 = address_.find(':') != std::string::npos;

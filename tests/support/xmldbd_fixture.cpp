@@ -10,15 +10,7 @@
 
 #include "platform/xmldbc.h"
 
-#ifndef KORV_XMLDBD_PATH  // built against the appliance's platform: no service of ours
-#define KORV_XMLDBD_PATH "xmldbd"
-#define KORV_XMLDBC_PATH "xmldbc"
-#endif
-
 namespace korv_test {
-
-std::string xmldbd_binary() { return KORV_XMLDBD_PATH; }
-std::string xmldbc_binary() { return KORV_XMLDBC_PATH; }
 
 XmldbProcess::~XmldbProcess()
 {

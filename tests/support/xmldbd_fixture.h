@@ -19,8 +19,8 @@
 namespace korv_test {
 
 // Path of the built xmldbd and xmldbc executables.
-std::string xmldbd_binary();
-std::string xmldbc_binary();
+inline std::string xmldbd_binary() { return KORV_XMLDBD_PATH; }
+inline std::string xmldbc_binary() { return KORV_XMLDBC_PATH; }
 
 // XmldbService's first argument: also serve "/var/run/xmldb_sock_sysinfo".
 inline constexpr bool kWithSysinfo = true;
