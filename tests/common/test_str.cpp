@@ -6,6 +6,7 @@
 #include <csignal>
 #include <cstring>
 #include <string>
+#include <tuple>
 #include <vector>
 
 #include <gtest/gtest.h>
@@ -17,14 +18,12 @@ namespace {
 
 TEST(CopyBounded, CutsTerminatesSaysWhetherAllFittedAndNeverReadsPastAField)
 {
-    const struct {
-        const char *src, *want;
-        bool fitted;
-    } cases[] = {{"abc", "abc", true}, {"abcd", "abc", false}, {"", "", true}, {nullptr, "", true}};
-    for (const auto &c : cases) {
+    const std::tuple<const char *, const char *, bool> cases[] = {
+        {"abc", "abc", true}, {"abcd", "abc", false}, {"", "", true}, {nullptr, "", true}};
+    for (const auto &[src, want, fitted] : cases) {
         char dst[4] = {'x', 'x', 'x', 'x'};
-        EXPECT_EQ(korv::copy_bounded(dst, c.src), c.fitted) << (c.src ? c.src : "NULL");
-        EXPECT_STREQ(dst, c.want);
+        EXPECT_EQ(korv::copy_bounded(dst, src), fitted) << (src ? src : "NULL");
+        EXPECT_STREQ(dst, want);
     }
     char none[1] = {'x'};
     EXPECT_FALSE(korv::copy_bounded(none, 0, "a"));

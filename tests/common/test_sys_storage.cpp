@@ -17,6 +17,7 @@
 #include "common/korvadm_err.h"
 #include "common/korvadm_sys_internal.h"
 #include "platform/xmldbc.h"
+#include "tests/common/data_cases.h"
 #include "tests/support/capture.h"
 #include "tests/support/sysroot.h"
 #include "tests/support/xmldbd_fixture.h"
@@ -29,18 +30,6 @@ namespace {
 
 namespace fs = std::filesystem;
 const std::string kData = KORV_TEST_DATA;
-
-// Data lines "<input> => <expected>", comments skipped.
-std::vector<std::pair<std::string, std::string>> cases(const std::string &name)
-{
-    std::ifstream in(kData + "/" + name);
-    std::vector<std::pair<std::string, std::string>> out;
-    for (std::string l; std::getline(in, l);)
-        if (size_t at = l.find(" => "); !l.empty() && l[0] != '#')
-            out.emplace_back(l.substr(0, at), at == std::string::npos ? "" : l.substr(at + 4));
-    EXPECT_FALSE(out.empty()) << name;
-    return out;
-}
 
 class Storage : public ::testing::Test {
 protected:
@@ -72,7 +61,7 @@ protected:
 
 TEST_F(Storage, DfOutputIsSharedOrRefused)
 {
-    for (const auto &[out, want] : cases("df_lines.txt")) {
+    for (const auto &[out, want] : data_cases("df_lines.txt")) {
         standin("df", "Filesystem 1B-blocks Used Available Use% Mounted on\\n" + out);
         U64s got(3, 7);  // left as they are on failure
         const int rc = quiet([&] { return _sys_get_df_info(&got[0], &got[1], &got[2], "/"); });
@@ -91,7 +80,7 @@ TEST_F(Storage, DfOutputIsSharedOrRefused)
 
 TEST_F(Storage, PowermgmtMaskGivesSleepingDisks)
 {
-    for (const auto &[in, want] : cases("powermgmt_answers.txt")) {
+    for (const auto &[in, want] : data_cases("powermgmt_answers.txt")) {
         size_t bar = in.rfind(" | ");
         standin("powermgmt", in.substr(0, bar), std::stoi(in.substr(bar + 3)));
         int *states = nullptr;
@@ -198,7 +187,7 @@ protected:
 
 TEST_F(RealMounts, MountPathAndLockStateByUuid)
 {
-    for (const auto &[uuid, want] : cases("mount_lookups.txt")) {
+    for (const auto &[uuid, want] : data_cases("mount_lookups.txt")) {
         char out[VOL_MNT_PATH_LEN] = "stale";
         const char *id = uuid == "\"\"" ? "" : uuid.c_str();  // clang 14 cannot capture a structured binding
         const int found = quiet([&] { return sys_raid_get_mnt_path_by_uuid(out, sizeof out, id); });

@@ -12,11 +12,14 @@
 
 #include <chrono>
 #include <cstring>
+#include <sstream>
 #include <string>
+#include <tuple>
 #include <vector>
 
 #include <gtest/gtest.h>
 
+#include "tests/common/data_cases.h"
 #include "tests/support/process.h"
 #include "tests/support/sysroot.h"
 
@@ -82,14 +85,11 @@ TEST_F(UtilsTest, SymlinkOverAnExistingLink)
 {
     const std::string link = at("/link");
     write_file(at("/plain"), "x");
-    const struct {
-        const char *target;
-        std::string link;
-        int rc;
-    } steps[] = {{"/target/one", link, 0}, {"/target/one", link, 0}, {"/target/two", link, -2},
-                 {"/target/one", at("/plain"), -1}, {"/t", at("/no/such/dir/link"), -1}};
-    for (const auto &s : steps)
-        EXPECT_EQ(create_symlink(s.target, s.link.c_str()), s.rc) << s.target << " at " << s.link;
+    const std::tuple<const char *, std::string, int> steps[] = {
+        {"/target/one", link, 0}, {"/target/one", link, 0}, {"/target/two", link, -2},
+        {"/target/one", at("/plain"), -1}, {"/t", at("/no/such/dir/link"), -1}};
+    for (const auto &[target, at_path, rc] : steps)
+        EXPECT_EQ(create_symlink(target, at_path.c_str()), rc) << target << " at " << at_path;
     char buf[64] = {0};
     ASSERT_GT(readlink(link.c_str(), buf, sizeof buf - 1), 0);
     EXPECT_STREQ(buf, "/target/one");
@@ -186,27 +186,19 @@ TEST_F(UtilsTest, NameCharacters)
     EXPECT_EQ(check_name_chars_valid(nullptr), -1);
 }
 
-// Addresses the C library parses must give its bytes; link-local is fe80::/10.
+// Addresses the C library parses must give its bytes (data/ipv6_texts.txt).
 TEST_F(UtilsTest, Ipv6TextToBytesAndLinkLocal)
 {
-    const struct {
-        const char *text, *same_as;  // same_as: the C library's text for it; nullptr: refused
-        int link_local;
-    } cases[] = {
-        {"fe80::1", "fe80::1", 1}, {"febf::1", "febf::1", 1}, {"fe80:1::1", "fe80:1::1", 0},
-        {"fec0::1", "fec0::1", 0}, {"::1", "::1", 0}, {"2001:db8::8:800:200c:417a", "2001:db8::8:800:200c:417a", 0},
-        {"fd00::", "fd00::", 0}, {"1:2:3:4:5:6:7:8", "1:2:3:4:5:6:7:8", 0},
-        {"1:2:3:4:5:6:7:8:", "1:2:3:4:5:6:7:8", 0},  // a trailing ':' adds no group
-        // groups that would land outside the 16 bytes
-        {"1:2:3:4:5:6:7:8:9", nullptr, -1}, {"::1:2:3:4:5:6:7:8:9", nullptr, -1}, {"::", nullptr, -1},
-    };
-    for (const auto &c : cases) {
-        unsigned char got[16], want[16];
-        EXPECT_EQ(ipv6_text_to_bytes(got, c.text), c.same_as ? 0 : -1) << c.text;
-        if (c.same_as && inet_pton(AF_INET6, c.same_as, want) == 1) {
-            EXPECT_EQ(std::memcmp(got, want, 16), 0) << c.text;
-        }
-        EXPECT_EQ(is_ipv6_link_local(c.text), c.link_local) << c.text;
+    for (const auto &[text, want] : data_cases("ipv6_texts.txt")) {
+        std::istringstream w(want);
+        std::string same_as;
+        int link_local = 0;
+        w >> same_as >> link_local;
+        unsigned char got[16], expect[16];
+        const bool refused = inet_pton(AF_INET6, same_as.c_str(), expect) != 1;  // as "refused" is
+        EXPECT_EQ(ipv6_text_to_bytes(got, text.c_str()), refused ? -1 : 0) << text;
+        EXPECT_TRUE(refused || std::memcmp(got, expect, 16) == 0) << text;
+        EXPECT_EQ(is_ipv6_link_local(text.c_str()), link_local) << text;
     }
 }
 

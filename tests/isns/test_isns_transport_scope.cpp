@@ -9,6 +9,7 @@
 
 #include <cstdlib>
 #include <cstring>
+#include <tuple>
 #include <net/if.h>
 #include <netinet/in.h>
 #include <sched.h>
@@ -82,18 +83,16 @@ int scope_case(const std::vector<std::string> &ifaces, const std::string &holder
 TEST(IsnsConnectTimeouts, LinkLocalScopesBond0FirstThenEth0AndEth1OneSecondEachOthersThreeSeconds)
 {
     const std::vector<std::string> all = {"bond0", "eth0", "eth1"}, no_bond = {"eth0", "eth1"};
-    const struct {
-        const std::vector<std::string> &ifaces;
-        const char *holder;  // "": nobody answers
-        const char *server;
-        double min_s;
-    } cases[] = {{all, "bond0", "fe80::1", 0.0}, {all, "eth0", "fe80::1", 0.9}, {all, "eth1", "fe80::1", 1.9},
-                 {no_bond, "eth0", "fe80::1", 0.0}, {no_bond, "eth1", "fe80::1", 0.9}, {all, "", "fe80::1", 2.9},
-                 {no_bond, "", "192.0.2.2", 2.9}, {no_bond, "", "2001:db8::2", 2.9}};
+    // Interfaces, the one holding the server ("": nobody answers), server, least seconds.
+    const std::tuple<const std::vector<std::string> &, const char *, const char *, double> cases[] = {
+        {all, "bond0", "fe80::1", 0.0}, {all, "eth0", "fe80::1", 0.9}, {all, "eth1", "fe80::1", 1.9},
+        {no_bond, "eth0", "fe80::1", 0.0}, {no_bond, "eth1", "fe80::1", 0.9}, {all, "", "fe80::1", 2.9},
+        {no_bond, "", "192.0.2.2", 2.9}, {no_bond, "", "2001:db8::2", 2.9}};
     for (const auto &c : cases) {
-        const int rc = korv_test::run_in_child([&] { return scope_case(c.ifaces, c.holder, c.server, c.min_s); });
+        const int rc = korv_test::run_in_child([&c] { return std::apply(scope_case, c); });
         if (rc == kSkip)
             GTEST_SKIP() << "no private network namespace with test interfaces here (reason above)";
-        EXPECT_EQ(rc, 0) << c.server << ", " << c.ifaces.size() << " interfaces, holder " << c.holder << " (details above)";
+        EXPECT_EQ(rc, 0) << std::get<2>(c) << ", " << std::get<0>(c).size() << " interfaces, holder " << std::get<1>(c)
+                         << " (details above)";
     }
 }
