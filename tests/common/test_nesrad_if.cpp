@@ -98,8 +98,7 @@ TEST_F(NesradControl, SettingStartsRestartsAndStopsOnlyWhenTheServiceRuns)
     EXPECT_EQ(0, isns_set_setting(1, hostile.c_str(), 0));
     ASSERT_TRUE(settled(1));
     const pid_t first = running_daemons().front();
-    ASSERT_TRUE(eventually([&] { return !standin_args().empty(); }, 10s));
-    EXPECT_EQ(hostile + "\n", standin_args());
+    EXPECT_TRUE(eventually([&] { return standin_args() == hostile + "\n"; }, 10s)) << standin_args();
     EXPECT_FALSE(exists(at("/x"))) << "a command in the server text ran";
 
     // Same server (stored one used): the running daemon is left alone.
@@ -141,7 +140,6 @@ TEST_F(NesradControl, NotifyReachesTheRealDaemonAndResetClearsTheSettings)
     xmldb_set_service_enable(1);
     ASSERT_EQ(0, isns_set_setting(1, "127.60.0.1", 0));
     ASSERT_TRUE(eventually([&] { return stored_pid() > 0; }, 10s));
-    ASSERT_TRUE(settled(1));
     notify_isnsclient(SIGTERM);
     EXPECT_TRUE(settled(0));
     EXPECT_EQ(0, isns_factory_reset());

