@@ -19,6 +19,7 @@
 #include <fstream>
 #include <string>
 #include <sys/wait.h>
+#include <tuple>
 #include <unistd.h>
 #include <vector>
 
@@ -83,46 +84,36 @@ protected:
 TEST_F(NesradControl, SettingStartsRestartsAndStopsOnlyWhenTheServiceRuns)
 {
     use_daemon_dir(STANDIN_DIR);
-    const std::string hostile = "isns\"$(touch x)`id`\\.example";
-
-    // Service disabled: only stored, nothing started.
-    xmldb_set_service_enable(0);
-    EXPECT_EQ(0, isns_set_setting(1, "first.example", 0));
-    EXPECT_EQ(stored(), "1 first.example");
-    EXPECT_TRUE(running_daemons().empty());
-    EXPECT_EQ(ERR_PARAM, isns_set_setting(2, "first.example", 0));
-
-    // Service enabled, flag already 1 with another server: a start with the
-    // escaped server, which reaches the daemon byte for byte.
-    xmldb_set_service_enable(1);
-    EXPECT_EQ(0, isns_set_setting(1, hostile.c_str(), 0));
-    ASSERT_TRUE(settled(1));
-    const pid_t first = running_daemons().front();
-    EXPECT_TRUE(eventually([&] { return standin_args() == hostile + "\n"; }, 10s)) << standin_args();
+    const std::string hostile = "isns\"$(touch x)`id`\\.example", both = hostile + "\nsecond.example\n";
+    // The service switch; the call's state, server and use_stored; its answer;
+    // then the stored settings, the stand-in's arguments so far (a line a
+    // start) and the daemons running.
+    const std::tuple<int, int, const char *, int, int, std::string, std::string, size_t> steps[] = {
+        // Service disabled: only stored, nothing started.
+        {0, 1, "first.example", 0, KORV_OK, "1 first.example", "", 0},
+        {0, 2, "first.example", 0, ERR_PARAM, "1 first.example", "", 0},
+        // Service enabled, flag already 1 with another server: a start with the
+        // escaped server, which reaches the daemon byte for byte.
+        {1, 1, hostile.c_str(), 0, KORV_OK, "1 " + hostile, hostile + "\n", 1},
+        // Same server (stored one used): the running daemon is left alone.
+        {1, 1, "ignored", 1, KORV_OK, "1 " + hostile, hostile + "\n", 1},
+        // Another server: stopped by name, then a new daemon.
+        {1, 1, "second.example", 0, KORV_OK, "1 second.example", both, 1},
+        // Off with the service disabled: stored only; with it enabled: stopped.
+        {0, 0, nullptr, 0, KORV_OK, "0 second.example", both, 1},
+        {1, 0, nullptr, 0, KORV_OK, "0 second.example", both, 0}};
+    for (const auto &[service, state, server, use_stored, rc, settings, starts, running] : steps) {
+        const std::vector<pid_t> before = running_daemons();
+        const std::string started = standin_args();
+        xmldb_set_service_enable(service);
+        EXPECT_EQ(rc, isns_set_setting(state, server, use_stored)) << settings;
+        EXPECT_EQ(stored(), settings);
+        EXPECT_TRUE(eventually([want = starts] { return standin_args() == want; }, 10s)) << standin_args();
+        EXPECT_TRUE(settled(running)) << settings;
+        // Neither started nor stopped: the very same daemon.
+        EXPECT_TRUE(starts != started || running != before.size() || running_daemons() == before) << settings;
+    }
     EXPECT_FALSE(exists(at("/x"))) << "a command in the server text ran";
-
-    // Same server (stored one used): the running daemon is left alone.
-    EXPECT_EQ(0, isns_set_setting(1, "ignored", 1));
-    EXPECT_EQ(std::vector<pid_t>{first}, running_daemons());
-    EXPECT_EQ(stored(), "1 " + hostile);
-
-    // Another server: stopped by name, then a new daemon.
-    EXPECT_EQ(0, isns_set_setting(1, "second.example", 0));
-    ASSERT_TRUE(eventually([&] { auto d = running_daemons(); return d.size() == 1 && d[0] != first; }, 10s));
-    EXPECT_TRUE(eventually([&] { return standin_args() == hostile + "\nsecond.example\n"; }, 10s));
-
-    // An empty server is refused before anything is stopped.
-    EXPECT_EQ(ERR_PARAM, isns_set_ctl_module(1, ""));
-    EXPECT_EQ(1u, running_daemons().size());
-
-    // Off with the service disabled: stored only; with it enabled: stopped.
-    xmldb_set_service_enable(0);
-    EXPECT_EQ(0, isns_set_setting(0, nullptr, 0));
-    EXPECT_EQ(stored(), "0 second.example");
-    EXPECT_EQ(1u, running_daemons().size());
-    xmldb_set_service_enable(1);
-    EXPECT_EQ(0, isns_set_setting(0, nullptr, 0));
-    EXPECT_TRUE(settled(0));
 }
 
 // The signal path itself (SIGUSR1, a target re-registered) runs end to end
@@ -140,6 +131,10 @@ TEST_F(NesradControl, NotifyReachesTheRealDaemonAndResetClearsTheSettings)
     xmldb_set_service_enable(1);
     ASSERT_EQ(0, isns_set_setting(1, "127.60.0.1", 0));
     ASSERT_TRUE(eventually([&] { return stored_pid() > 0; }, 10s));
+    // An empty server is refused before anything is stopped (a daemon stopped
+    // is gone well within the second).
+    EXPECT_EQ(ERR_PARAM, isns_set_ctl_module(1, ""));
+    EXPECT_FALSE(eventually([&] { return running_daemons().empty(); }, 1s));
     notify_isnsclient(SIGTERM);
     EXPECT_TRUE(settled(0));
     EXPECT_EQ(0, isns_factory_reset());

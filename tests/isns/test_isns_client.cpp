@@ -42,8 +42,4 @@ TEST(IsnsOpenIsns, RegistrationLifecycle)
     // knows the source no more than after the deregistration: one check.)
     EXPECT_EQ(register_two(2, {"192.168.1.10"}, {"192.168.1.20"}), -1);
     EXPECT_EQ(isns_last_status, 3);
-    EXPECT_EQ(isns_check_registration(kT2), 0);
-
-    srv.stop();
-    EXPECT_EQ(isns_check_registration(kT1), -1);
 }
