@@ -31,7 +31,6 @@ inline void reset_client(const char *server, int family = AF_INET, const char *s
     korv::copy_bounded(isns_server_addr, server);
     isns_addr_family = family;
     korv::copy_bounded(isns_entity_id, "nas1");
-    std::memset(isns_entity_name, 0, sizeof isns_entity_name);
     korv::copy_bounded(isns_entity_name, source);
     isns_trace = 0;
     isns_alias_on = 0;
