@@ -469,7 +469,7 @@ int main(int argc, char **argv)
 
     std::string adm_conf;
     child isnsd = start_isnsd(kServer, "isns", &adm_conf);
-    if (argc > 2 && std::strcmp(argv[1], "--trace") == 0) {
+    if (trace_run) {
         int rc = trace_mode(adm_conf, argv[2]);
         kill(isnsd.pid, SIGTERM);
         reap(isnsd);
