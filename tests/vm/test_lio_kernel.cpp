@@ -107,7 +107,7 @@ TEST_F(LioTarget, AddCreatesThePortalGroupWithItsDefaultsOnce)
     EXPECT_EQ(subdirs(tpg_ + "/acls"), Strings{});
 
     // Adding it again changes nothing.
-    ASSERT_EQ(poke(tpg_ + "/param/TargetAlias", "changed by hand"), 0);
+    ASSERT_EQ(configfs_write_attr_str((tpg_ + "/param/TargetAlias").c_str(), "changed by hand", 0), 0);
     EXPECT_EQ(lio3_add_target(t_.get()), 0);
     EXPECT_EQ(attr("param/TargetAlias"), "changed by hand\n");
     // The kernel refuses out-of-range values; of line ends, the kernel's own
@@ -204,7 +204,7 @@ TEST_F(LioTarget, EnableAndDisable)
     ASSERT_EQ(lio3_add_target(t_.get()), 0);
     using Switch = std::pair<int (*)(iscsi_target_t *), const char *>;
     for (auto [call, state] : {Switch{lio3_enable_target, "1\n"}, Switch{lio3_disable_target, "0\n"}}) {
-        ASSERT_EQ(poke(tpg_ + "/param/AuthMethod", "None"), 0);
+        ASSERT_EQ(configfs_write_attr_str((tpg_ + "/param/AuthMethod").c_str(), "None", 0), 0);
         EXPECT_EQ(call(t_.get()), 0);
         EXPECT_EQ(call(t_.get()), 0) << "again";
         EXPECT_EQ(attr("enable"), state);
