@@ -31,11 +31,7 @@ bool kernel_listens(int port, bool ipv6)
 
 // ---- starting and stopping the driver ----
 
-class LioModules : public ::testing::Test {
-protected:
-    void SetUp() override { ASSERT_EQ(iscsi_mod_select(ISCSI_MOD_TYPE_LIO), 0); }
-    void TearDown() override { expect_stopped(); }
-};
+using LioModules = Driver;
 
 // The order of the modules and the rollback when one is missing are the host
 // tests' (test_lio4_module.cpp): the real kernel adds nothing to them. What
@@ -43,6 +39,7 @@ protected:
 // configfs in an order the kernel accepts.
 TEST_F(LioModules, StopTearsDownEverythingTheKernelHolds)
 {
+    expect_stopped();
     ASSERT_EQ(::system("umount /sys/kernel/config"), 0);
     ASSERT_EQ(iscsi_mod_start(), 0);
     EXPECT_TRUE(exists(kIscsi)) << "start did not mount configfs";
@@ -63,7 +60,7 @@ TEST_F(LioModules, StopTearsDownEverythingTheKernelHolds)
     // so the driver must have emptied configfs first, in an order it accepts.
     ASSERT_NE(::system("rmmod iscsi_target_mod 2>/dev/null"), 0);
 
-    expect_stopped();
+    expect_stopped();  // and again when the test ends, with nothing left to do
     EXPECT_FALSE(kernel_listens(3260, false));
 }
 
@@ -82,7 +79,6 @@ protected:
     {
         static int n = 0;
         t_ = make_target("iqn.2026-01.vm:target" + std::to_string(++n), 1);
-        ASSERT_TRUE(t_);
         tpg_ = tpg_dir(t_.get());
     }
     void TearDown() override { EXPECT_EQ(lio3_del_target(t_.get()), 0) << "left-over target"; }
