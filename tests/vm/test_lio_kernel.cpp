@@ -33,16 +33,26 @@ bool kernel_listens(int port, bool ipv6)
 
 using LioModules = Driver;
 
-// The order of the modules and the rollback when one is missing are the host
-// tests' (test_lio4_module.cpp): the real kernel adds nothing to them. What
-// it adds: start mounts configfs when it is not, and stop empties a full
-// configfs in an order the kernel accepts.
-TEST_F(LioModules, StopTearsDownEverythingTheKernelHolds)
+// Start: the modules in an order the kernel takes, configfs mounted when it
+// is not, and a start that fails removing again what it inserted. Stop: a
+// full configfs emptied in an order the kernel accepts.
+TEST_F(LioModules, StartAndStopDoAndUndoEverythingInTheKernelsOrder)
 {
     expect_stopped();
+    EXPECT_EQ(iscsi_mod_get_state(), 1);
+    // A module missing: start fails and removes the two it inserted, so
+    // stop finds nothing to do.
+    ASSERT_EQ(::rename("/usr/local/modules/driver/iscsi_target_mod.ko", "/tmp/iscsi_target_mod.ko"), 0);
+    const int rc = iscsi_mod_start();
+    ASSERT_EQ(::rename("/tmp/iscsi_target_mod.ko", "/usr/local/modules/driver/iscsi_target_mod.ko"), 0);
+    EXPECT_EQ(rc, ERR_MODULE_START);
+    expect_stopped();
+
     ASSERT_EQ(::system("umount /sys/kernel/config"), 0);
     ASSERT_EQ(iscsi_mod_start(), 0);
     EXPECT_TRUE(exists(kIscsi)) << "start did not mount configfs";
+    EXPECT_TRUE(exists("/var/target/pr"));
+    EXPECT_EQ(iscsi_mod_get_state(), 0);
     // Two portal groups under each IQN: the first group's deletion cannot
     // remove its IQN yet, which must not end the walk over the others.
     Target t = serve("iqn.2026-01.vm:stop-full", "127.0.0.1", "::1"), full2 = make_target(t->iqn, 2);
@@ -62,6 +72,7 @@ TEST_F(LioModules, StopTearsDownEverythingTheKernelHolds)
 
     expect_stopped();  // and again when the test ends, with nothing left to do
     EXPECT_FALSE(kernel_listens(3260, false));
+    EXPECT_EQ(iscsi_mod_get_state(), 1);
 }
 
 // ---- targets in a running driver ----
