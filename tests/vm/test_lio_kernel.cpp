@@ -33,21 +33,14 @@ bool kernel_listens(int port, bool ipv6)
 
 using LioModules = Driver;
 
-// Start: the modules in an order the kernel takes, configfs mounted when it
-// is not, and a start that fails removing again what it inserted. Stop: a
-// full configfs emptied in an order the kernel accepts.
+// Start: the modules in an order the kernel takes and configfs mounted when
+// it is not (the order of the calls and the roll-back of a failed start are
+// the host's, test_lio4_module.cpp). Stop: a full configfs emptied in an
+// order the kernel accepts.
 TEST_F(LioModules, StartAndStopDoAndUndoEverythingInTheKernelsOrder)
 {
     expect_stopped();
     EXPECT_EQ(iscsi_mod_get_state(), 1);
-    // A module missing: start fails and removes the two it inserted, so
-    // stop finds nothing to do.
-    ASSERT_EQ(::rename("/usr/local/modules/driver/iscsi_target_mod.ko", "/tmp/iscsi_target_mod.ko"), 0);
-    const int rc = iscsi_mod_start();
-    ASSERT_EQ(::rename("/tmp/iscsi_target_mod.ko", "/usr/local/modules/driver/iscsi_target_mod.ko"), 0);
-    EXPECT_EQ(rc, ERR_MODULE_START);
-    expect_stopped();
-
     ASSERT_EQ(::system("umount /sys/kernel/config"), 0);
     ASSERT_EQ(iscsi_mod_start(), 0);
     EXPECT_TRUE(exists(kIscsi)) << "start did not mount configfs";
