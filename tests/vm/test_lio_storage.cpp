@@ -121,10 +121,8 @@ TEST_F(LioStorage, AnInitiatorGetsExactlyTheRightsTheDriverSets)
     EXPECT_EQ(iscsi_mod_del_backstore(&b), ERR_PARAM) << "a linked backstore went";
     EXPECT_TRUE(exists(b.path));
 
-    for (const std::string &i : {kRw, kRo, kDeny, std::string("default_policy")})
+    for (const std::string &i : {kRw, kRo, kDeny})
         ASSERT_EQ(iscsi_mod_add_acl_initiator(i.c_str(), t.get()), 0) << i;
-    EXPECT_FALSE(exists(tpg + "/acls/default_policy"));
-    EXPECT_EQ(slurp(tpg + "/acls/" + kRw + "/attrib/dataout_timeout"), "5\n");
     ASSERT_EQ(grant(t.get(), 0, kRw, 2) | grant(t.get(), 255, kRw, 2), 0);
     ASSERT_EQ(grant(t.get(), 0, kRo, 1) | grant(t.get(), 255, kDeny, 1), 0);
     ASSERT_EQ(iscsi_mod_enable_target(t.get()), 0);
@@ -199,7 +197,7 @@ TEST_F(LioStorage, AnInitiatorGetsExactlyTheRightsTheDriverSets)
 
     // Taken apart in the kernel's order: rights, ACLs, mappings, backstores.
     EXPECT_EQ(grant(t.get(), 0, kRw, 0) | grant(t.get(), 0, kRo, 0) | grant(t.get(), 255, kRw, 0), 0);
-    for (const std::string &i : {kRw, kRo, kDeny, std::string("default_policy")})
+    for (const std::string &i : {kRw, kRo, kDeny})
         EXPECT_EQ(iscsi_mod_del_acl_initiator(i.c_str(), t.get()), 0) << i;
     EXPECT_EQ(iscsi_mod_del_lun_mapping(&a, t.get()) | iscsi_mod_del_lun_mapping(&b, t.get()), 0);
     EXPECT_EQ(iscsi_mod_del_backstore(&a) | iscsi_mod_del_backstore(&b), 0);
