@@ -610,11 +610,9 @@ int nesrad_main(int argc, char **argv, unsigned poll_interval)
         }
         if (count > 0 && target_register_iSNS_all() == 0)
             g_registered = 1;
-        // Nothing reads the node list again before the next pass reads the
-        // targets afresh: it goes, with the target records read for the
-        // pass, and their pages go back to the system for the long waits
-        // (about 80 KiB at 64 targets).
-        _iqn_clear();
+        // The target records read for the pass are freed by now: their pages
+        // go back to the system for the long waits. The node list stays
+        // until the clean-up, as the daemon's record of what it registered.
         malloc_trim(0);
 
         wake how = wait_for_event(count);
