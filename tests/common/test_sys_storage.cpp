@@ -10,14 +10,13 @@
 #include <cerrno>
 #include <cstring>
 #include <filesystem>
-#include <fstream>
 
 #include <gtest/gtest.h>
 
 #include "common/korvadm_err.h"
 #include "common/korvadm_sys_internal.h"
 #include "platform/xmldbc.h"
-#include "tests/common/data_cases.h"
+#include "tests/support/data_cases.h"
 #include "tests/support/capture.h"
 #include "tests/support/sysroot.h"
 #include "tests/support/xmldbd_fixture.h"
@@ -157,10 +156,8 @@ protected:
             ASSERT_EQ(mount("tmpfs", m.c_str(), "tmpfs", 0, "size=4m"), 0) << m;
             mounted_.push_back(m);
         }
-        std::ifstream in(kData + "/sysinfo_volumes.txt");
-        for (std::string l; std::getline(in, l);)
-            if (!l.empty() && l[0] != '#')
-                put(l.substr(0, l.find(" = ")), subst(l.substr(l.find(" = ") + 3)));
+        for (const auto &[path, value] : data_cases("sysinfo_volumes.txt"))
+            put(path, subst(value));
     }
     // The mount points for their @NAME@ placeholders.
     std::string subst(std::string text) const

@@ -9,7 +9,7 @@
 
 #include <gtest/gtest.h>
 
-#include "tests/common/data_cases.h"
+#include "tests/support/data_cases.h"
 #include "tests/support/capture.h"
 
 TEST(SysrootTest, MapsUnderTheRootWhenSetAndOnlyThen)

@@ -19,7 +19,7 @@
 
 #include <gtest/gtest.h>
 
-#include "tests/common/data_cases.h"
+#include "tests/support/data_cases.h"
 #include "tests/support/process.h"
 #include "tests/support/sysroot.h"
 

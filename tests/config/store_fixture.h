@@ -27,7 +27,7 @@
 namespace korv_test {
 
 // A sample database tree under tests/config/data.
-inline std::string data_file(const char *name) { return std::string(KORV_CONFIG_DATA) + "/" + name; }
+inline std::string data_file(const char *name) { return std::string(KORV_TEST_DATA) + "/" + name; }
 
 // A data file's lines without comments.
 inline std::string data(const char *name)

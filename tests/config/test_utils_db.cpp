@@ -4,10 +4,13 @@
 #include <cstdlib>
 #include <cstring>
 #include <cerrno>
+#include <functional>
+#include <map>
 #include <tuple>
 
 #include "config/korvadm_utils_db.h"
 #include "tests/config/store_fixture.h"
+#include "tests/support/data_cases.h"
 
 using namespace korv_test;
 
@@ -76,40 +79,30 @@ TEST(StrNdup, CopiesAtMostMaxLenAndTerminates)
 
 TEST(Converters, AcceptTrailingTextAndReportFailuresOnStandardError)
 {
-    // Each call as "result/value[/text left]", and what it printed on
-    // standard error: nothing, the no-digits line, or perror's line.
-    static char *end;
-    static long l;
-    static uint64_t u;
-    const std::string none = "No digits were found\n", range = "strtoll: " + std::string(std::strerror(ERANGE)) + "\n";
-    const std::tuple<std::string (*)(), const char *, std::string> cases[] = {
-        {[] { return slash(convert_dec_str_to_l("0x10", &end, &l), l, end); }, "0/0/x10", {}},
-        {[] { return slash(convert_hex_str_to_l("ff", nullptr, &l), l); }, "0/255", {}},
-        {[] { return slash(convert_dec_str_to_uint64_t("  123kb", &end, &u), u, end); }, "0/123/kb", {}},
-        {[] { return slash(convert_str_to_uint64_t("42 ", &u), u); }, "0/42", {}},
-        // Parsed signed: LLONG_MAX is the largest accepted even for the unsigned type.
-        {[] { return slash(convert_dec_str_to_uint64_t("9223372036854775807", &end, &u), u); },
-         "0/9223372036854775807", {}},
-        {[] { return slash(convert_hex_str_to_l("zz", &end, &l)); }, "-1", none},
-        {[] { return slash(convert_str_to_uint64_t("", &u)); }, "1", none},
-        {[] { return slash(convert_dec_str_to_uint64_t("-", &end, &u)); }, "-1", none},
-        {[] { return slash(convert_dec_str_to_uint64_t("9223372036854775808", &end, &u)); }, "-1", range},
-        {[] { return slash(convert_dec_str_to_l("-99999999999999999999", &end, &l)); }, "-1", range},
-        {[] { return slash(convert_hex_str_to_l("fffffffffffffffff", &end, &l)); }, "-1", range},
-        {[] {
-             u = 5;  // a failed unsigned conversion clears its result
-             return slash(convert_str_to_uint64_t("18446744073709551616", &u), u);
-         },
-         "1/0", range},
-    };
-    for (const auto &[call, want, err] : cases) {
+    char *end = nullptr;
+    long l;
+    uint64_t u;
+    const std::map<std::string, std::function<std::string(const char *)>> convert = {
+        {"u64", [&](const char *s) { return slash(convert_str_to_uint64_t(s, &u), u); }},
+        {"dec_u64", [&](const char *s) { return slash(convert_dec_str_to_uint64_t(s, &end, &u), u, end); }},
+        {"dec_l", [&](const char *s) { return slash(convert_dec_str_to_l(s, &end, &l), l, end); }},
+        {"hex_l", [&](const char *s) { return slash(convert_hex_str_to_l(s, nullptr, &l), l); }}};
+    const std::map<std::string, std::string> printed = {
+        {"nothing", ""},
+        {"no-digits", "No digits were found\n"},
+        {"range", "strtoll: " + std::string(std::strerror(ERANGE)) + "\n"}};
+    for (const auto &[call, want] : data_cases("converters.txt")) {
+        const std::string fn = call.substr(0, call.find(' '));
+        const std::string arg = call.substr(fn.size() + 2, call.size() - fn.size() - 3);  // inside the quotes
         std::string got;
-        auto run = call;  // clang 14 cannot capture a structured binding
-        EXPECT_EQ(capture_stderr([&] { got = run(); }), err) << want;
-        EXPECT_EQ(got, want);
+        l = 5;
+        u = 5;
+        EXPECT_EQ(capture_stderr([&] { got = convert.at(fn)(arg.c_str()); }), printed.at(want.substr(want.rfind(' ') + 1)))
+            << call;
+        EXPECT_EQ(got, want.substr(0, want.rfind(' '))) << call;
     }
-    EXPECT_EQ(logged([] { return convert_dec_str_to_l(nullptr, &end, &l); }, "ERR_PARAM_ERROR"), ERR_PARAM);
-    EXPECT_EQ(quiet([] { return convert_hex_str_to_l("1", &end, nullptr); }), ERR_PARAM);
-    EXPECT_EQ(quiet([] { return convert_dec_str_to_uint64_t(nullptr, &end, &u); }), ERR_PARAM);
-    EXPECT_EQ(quiet([] { return convert_str_to_uint64_t(nullptr, &u); }), ERR_PARAM);
+    EXPECT_EQ(logged([&] { return convert_dec_str_to_l(nullptr, &end, &l); }, "ERR_PARAM_ERROR"), ERR_PARAM);
+    EXPECT_EQ(quiet([&] { return convert_hex_str_to_l("1", &end, nullptr); }), ERR_PARAM);
+    EXPECT_EQ(quiet([&] { return convert_dec_str_to_uint64_t(nullptr, &end, &u); }), ERR_PARAM);
+    EXPECT_EQ(quiet([&] { return convert_str_to_uint64_t(nullptr, &u); }), ERR_PARAM);
 }

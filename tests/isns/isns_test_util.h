@@ -5,7 +5,6 @@
 
 #include <arpa/inet.h>
 #include <chrono>
-#include <cstring>
 #include <fstream>
 #include <memory>
 #include <sstream>

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// Sample cases kept as data: lines "<input> => <expected>" of a file under
-// tests/common/data, "#" lines and empty ones skipped.
+// Sample cases kept as data: lines "<input> => <expected>" of a file in the
+// suite's data directory (KORV_TEST_DATA), "#" lines and empty ones skipped.
 #pragma once
 
 #include <fstream>
