@@ -28,7 +28,6 @@ using U64s = std::vector<uint64_t>;
 namespace {
 
 namespace fs = std::filesystem;
-const std::string kData = KORV_TEST_DATA;
 
 class Storage : public ::testing::Test {
 protected:
@@ -44,7 +43,7 @@ protected:
     void standin(const std::string &cmd, const std::string &out, int rc = 0)
     {
         std::error_code ec;
-        fs::create_symlink(kData + "/standin", SysRoot::file("/standin/bin/" + cmd), ec);
+        fs::create_symlink(KORV_TEST_DATA "/standin", SysRoot::file("/standin/bin/" + cmd), ec);
         SysRoot::write("/standin/" + cmd + ".out", out);
         SysRoot::write("/standin/" + cmd + ".rc", std::to_string(rc));
         setenv("PATH", (SysRoot::file("/standin/bin") + ":" + path_).c_str(), 1);

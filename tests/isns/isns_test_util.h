@@ -50,11 +50,6 @@ inline isns_iscsi_node *make_node(const char *name, uint32_t tag, const std::vec
     return n;
 }
 
-inline bytes status_rsp(uint32_t status, uint16_t func = 0x8002)
-{
-    return isns_pdu(func, 0x4c00, be32(status));
-}
-
 // A scripted server on address answering every connection with reply, and
 // the client pointed at it with `source` as the source name.
 inline std::unique_ptr<isns_fake_server> fake_at(const char *address, isns_fake_reply reply, const char *source = "")

@@ -16,7 +16,7 @@ TEST(IsnsEncoding, RequestsAreTheRecordedBytes)
     std::map<std::string, bytes> want;
     for (const pdu_record &r : pdu_records(KORV_ISNS_DATA "/requests.txt"))
         want[r.label] = r.data;
-    auto srv = fake_at("127.10.1.1", {status_rsp(0, 0x8001)}, "iqn.x:t1");
+    auto srv = fake_at("127.10.1.1", {isns_pdu(0x8001, 0x4c00, be32(0))}, "iqn.x:t1");
     emit_hdr(1);
     for (const char *text : {"iqn.x", "iqn.xyz", static_cast<const char *>(nullptr), ""})
         emit_attr(32, text);

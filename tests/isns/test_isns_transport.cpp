@@ -55,7 +55,7 @@ TEST(IsnsReceive, JoinedPayloadsMayFillTheBufferButNoMore)
 // whatever the debug level, for a refused status and an unreachable server.
 TEST(IsnsReceive, StatusStaysReadableAfterFailureAndNothingIsPrinted)
 {
-    auto srv = fake_at("127.10.2.7", {status_rsp(6)});
+    auto srv = fake_at("127.10.2.7", {isns_pdu(0x8002, 0x4c00, be32(6))});
     const int level = std::exchange(g_korv_debug_level, 4);
     EXPECT_EQ(capture_stdout([] {
                   emit_hdr(2);
@@ -96,7 +96,7 @@ TEST(IsnsTimeLimits, SlowOrSilentServersFailWithinTheirLimits)
 // Time-outs of servers that never answer: test_isns_transport_scope.
 TEST(IsnsConnect, AddressTextMustParseForItsFamilyAndARefusalIsAtOnce)
 {
-    auto srv = fake_at("127.10.3.4", {status_rsp(0)});
+    auto srv = fake_at("127.10.3.4", {isns_pdu(0x8002, 0x4c00, be32(0))});
     int fd = -1;
     for (auto [family, text] : {std::pair{AF_INET, ""}, {AF_INET, "nas.example"}, {AF_INET, "::1"},
                                 {AF_INET6, "127.10.3.4"}, {AF_UNIX, "127.10.3.4"}})
