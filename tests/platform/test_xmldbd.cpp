@@ -12,7 +12,6 @@
 #include <cstring>
 #include <deque>
 #include <filesystem>
-#include <fstream>
 #include <random>
 #include <tuple>
 
@@ -75,17 +74,14 @@ std::string be32(uint32_t v)
 // A figure of /proc/PID/status ("VmHWM: N kB"), in bytes.
 size_t memory(pid_t pid, const std::string &key)
 {
-    std::ifstream in("/proc/" + std::to_string(pid) + "/status");
-    std::string all((std::istreambuf_iterator<char>(in)), {});
+    const std::string all = SysRootTest::read_file("/proc/" + std::to_string(pid) + "/status");
     return std::stoul(all.substr(all.find(key + ":") + key.size() + 1)) * 1024;
 }
 
 // The CPU time the process has used so far, in nanoseconds.
 unsigned long long cpu_ns(pid_t pid)
 {
-    unsigned long long ns = 0;
-    std::ifstream("/proc/" + std::to_string(pid) + "/schedstat") >> ns;
-    return ns;
+    return std::stoull("0" + SysRootTest::read_file("/proc/" + std::to_string(pid) + "/schedstat"));
 }
 
 // A shell command's status and output (standard error included); a program

@@ -43,49 +43,40 @@ public:
 
     uint64_t capacity(int lun)  // READ CAPACITY(16) in bytes; 0 when refused
     {
-        uint64_t bytes = 0;
-        run([&] { return iscsi_readcapacity16_sync(ctx_, lun); }, [&](scsi_task *t) {
-            if (auto *rc = static_cast<scsi_readcapacity16 *>(scsi_datain_unmarshall(t)))
-                bytes = (rc->returned_lba + 1) * rc->block_length;
-        });
-        return bytes;
+        Task t = run([&] { return iscsi_readcapacity16_sync(ctx_, lun); });
+        auto *rc = good(t) ? static_cast<scsi_readcapacity16 *>(scsi_datain_unmarshall(t.get())) : nullptr;
+        return rc ? (rc->returned_lba + 1) * rc->block_length : 0;
     }
     int write(int lun, uint64_t lba, std::string data)
     {
-        return run([&] {
+        Task t = run([&] {
             return iscsi_write16_sync(ctx_, lun, lba, reinterpret_cast<unsigned char *>(data.data()), 512, 512, 0,
                                       0, 0, 0, 0);
         });
+        return t ? t->status : -1;
     }
     std::string read(int lun, uint64_t lba)
     {
-        std::string out;
-        run([&] { return iscsi_read16_sync(ctx_, lun, lba, 512, 512, 0, 0, 0, 0, 0); },
-            [&](scsi_task *t) { out.assign(reinterpret_cast<char *>(t->datain.data), t->datain.size); });
-        return out;
+        Task t = run([&] { return iscsi_read16_sync(ctx_, lun, lba, 512, 512, 0, 0, 0, 0, 0); });
+        return good(t) ? std::string(reinterpret_cast<char *>(t->datain.data), t->datain.size) : "";
     }
 
     bool up = false;
     int sense = -1;  // of the last command
 
 private:
-    // Runs a command (again once after the unit attention that the first
-    // command on a LUN gets) and hands a good result to `good`.
-    template <class Command, class Good = void (*)(scsi_task *)>
-    int run(Command command, Good good = [](scsi_task *) {})
+    using Task = std::unique_ptr<scsi_task, decltype(&scsi_free_scsi_task)>;
+    static bool good(const Task &t) { return t && t->status == SCSI_STATUS_GOOD; }
+    // Runs a command, again once after the unit attention that the first
+    // command on a LUN gets.
+    template <class Command>
+    Task run(Command command)
     {
-        scsi_task *t = command();
-        if (t && t->status == SCSI_STATUS_CHECK_CONDITION && t->sense.key == SCSI_SENSE_UNIT_ATTENTION) {
-            scsi_free_scsi_task(t);
-            t = command();
-        }
-        int status = t ? t->status : -1;
+        Task t(command(), scsi_free_scsi_task);
+        if (t && t->status == SCSI_STATUS_CHECK_CONDITION && t->sense.key == SCSI_SENSE_UNIT_ATTENTION)
+            t.reset(command());
         sense = t ? t->sense.key : -1;
-        if (status == SCSI_STATUS_GOOD)
-            good(t);
-        if (t)
-            scsi_free_scsi_task(t);
-        return status;
+        return t;
     }
     iscsi_context *ctx_;
 };
@@ -110,11 +101,11 @@ TEST_F(LioStorage, AnInitiatorGetsExactlyTheRightsTheDriverSets)
     iscsi_lun_t b = make_lun("disk255", kOwnDir + "/disk255.img", 1 * kMiB, 1);
     ASSERT_EQ(iscsi_mod_add_backstore(&a), 0);
     ASSERT_EQ(iscsi_mod_add_backstore(&b), 0);
-    EXPECT_NE(slurp(kCore + "/fileio_1/disk0/wwn/vpd_unit_serial").find("sn-disk0"), std::string::npos);
+    EXPECT_NE(read_file(kCore + "/fileio_1/disk0/wwn/vpd_unit_serial").find("sn-disk0"), std::string::npos);
     EXPECT_TRUE(exists("/var/target/alua/tpgs_sn-disk0"));
     a.size = 2 * kMiB;  // adding it again leaves the device as it was
     EXPECT_EQ(iscsi_mod_add_backstore(&a), 0);
-    EXPECT_NE(slurp(kCore + "/fileio_1/disk0/info").find("Size: 4194304"), std::string::npos);
+    EXPECT_NE(read_file(kCore + "/fileio_1/disk0/info").find("Size: 4194304"), std::string::npos);
 
     ASSERT_EQ(iscsi_mod_add_lun_mapping(&a, t.get(), 0), 0);
     ASSERT_EQ(iscsi_mod_add_lun_mapping(&b, t.get(), 255), 0);
@@ -147,7 +138,7 @@ TEST_F(LioStorage, AnInitiatorGetsExactlyTheRightsTheDriverSets)
     EXPECT_EQ(rw.capacity(0), 4 * kMiB) << "read-only disturbed a session";
     ASSERT_EQ(grant(t.get(), 255, kDeny, 0) | grant(t.get(), 0, kDeny, 0), 0);
     EXPECT_EQ(rw.capacity(0), 0u) << "a session outlived deny: the target was not switched off";
-    EXPECT_EQ(slurp(tpg + "/enable"), "1\n");
+    EXPECT_EQ(read_file(tpg + "/enable"), "1\n");
     Session denied(kDeny, t->iqn);
     ASSERT_TRUE(denied.up) << "its ACL admits it";
     EXPECT_EQ(denied.capacity(255), 0u);
@@ -167,11 +158,11 @@ TEST_F(LioStorage, AnInitiatorGetsExactlyTheRightsTheDriverSets)
     std::strcpy(t->mutual_user, "vmtarget");
     std::strcpy(t->mutual_pass, "mutualsecret1234");
     ASSERT_EQ(iscsi_mod_set_target_chap(t.get()), 0);
-    EXPECT_EQ(slurp(tpg + "/param/AuthMethod"), "CHAP,None\n");
+    EXPECT_EQ(read_file(tpg + "/param/AuthMethod"), "CHAP,None\n");
     for (const std::string &i : {kRw, kRo, kDeny}) {
         const std::string auth = tpg + "/acls/" + i + "/auth/";
-        EXPECT_EQ(slurp(auth + "userid") + slurp(auth + "password") + slurp(auth + "userid_mutual") +
-                      slurp(auth + "password_mutual"),
+        EXPECT_EQ(read_file(auth + "userid") + read_file(auth + "password") +
+                      read_file(auth + "userid_mutual") + read_file(auth + "password_mutual"),
                   std::string("vmuser\n") + kSecret + "\nvmtarget\nmutualsecret1234\n") << i;
     }
     EXPECT_FALSE(Session("iqn.2026-01.vm:no-acl", t->iqn, kSecret).up);
@@ -181,7 +172,8 @@ TEST_F(LioStorage, AnInitiatorGetsExactlyTheRightsTheDriverSets)
     // CHAP off: the switch drops, the credentials stay, no secret is asked.
     t->chap = 0;
     ASSERT_EQ(iscsi_mod_set_target_chap(t.get()), 0);
-    EXPECT_EQ(slurp(tpg + "/attrib/authentication") + slurp(tpg + "/acls/" + kRw + "/auth/userid"), "0\nvmuser\n");
+    EXPECT_EQ(read_file(tpg + "/attrib/authentication") + read_file(tpg + "/acls/" + kRw + "/auth/userid"),
+              "0\nvmuser\n");
 
     // A resize shows in the capacity the initiator reads.
     a.size = 8 * kMiB;
@@ -193,7 +185,7 @@ TEST_F(LioStorage, AnInitiatorGetsExactlyTheRightsTheDriverSets)
     for (int seconds : {7, 61, 0})
         EXPECT_EQ(iscsi_mod_set_dataout_timeout(seconds, t.get()), 0) << seconds;
     for (const std::string &i : {kRw, kRo, kDeny})
-        EXPECT_EQ(slurp(tpg + "/acls/" + i + "/attrib/dataout_timeout"), "7\n") << i;
+        EXPECT_EQ(read_file(tpg + "/acls/" + i + "/attrib/dataout_timeout"), "7\n") << i;
 
     // Taken apart in the kernel's order: rights, ACLs, mappings, backstores.
     EXPECT_EQ(grant(t.get(), 0, kRw, 0) | grant(t.get(), 0, kRo, 0) | grant(t.get(), 255, kRw, 0), 0);

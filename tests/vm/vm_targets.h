@@ -11,14 +11,13 @@
 #include <algorithm>
 #include <cstdio>
 #include <filesystem>
-#include <fstream>
 #include <memory>
-#include <sstream>
 #include <string>
 #include <vector>
 
 #include "kernel/korvadm_mod.h"
 #include "tests/support/process.h"
+#include "tests/support/sysroot.h"
 
 namespace vm {
 
@@ -114,14 +113,7 @@ inline ino_t inode_of(const std::string &path)
 inline bool exists(const std::string &path) { return inode_of(path) != 0; }
 
 // The file's text as the kernel gives it (line end included).
-inline std::string slurp(const std::string &path)
-{
-    // A /proc file whose process is reaped mid-read fails the read itself;
-    // streaming the buffer turns that into failbit instead of a throw.
-    std::ifstream in(path);
-    std::ostringstream text;
-    return in && text << in.rdbuf() ? text.str() : "<unreadable: " + path + ">";
-}
+inline constexpr auto read_file = &korv_test::SysRootTest::read_file;
 
 inline std::vector<std::string> subdirs(const std::string &dir)
 {
