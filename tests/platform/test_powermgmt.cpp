@@ -4,12 +4,12 @@
 #include <unistd.h>
 
 #include <filesystem>
-#include <fstream>
 #include <sstream>
 
 #include <gtest/gtest.h>
 
 #include "platform/xmldbc.h"
+#include "tests/support/data_cases.h"
 #include "tests/support/xmldbd_fixture.h"
 
 using korv_test::SysRoot;
@@ -19,26 +19,23 @@ TEST(Powermgmt, MasksTheDisksInStandby)
     korv_test::XmldbService db(korv_test::kWithSysinfo);
     setenv("PATH", (std::string(KORV_TEST_DATA) + ":" + std::getenv("PATH")).c_str(), 1);
     ASSERT_EQ(chdir(SysRoot::path().c_str()), 0);
-    std::ifstream in(std::string(KORV_TEST_DATA) + "/powermgmt_disks.txt");
-    for (std::string line; std::getline(in, line);) {
-        if (line.empty() || line[0] == '#')
-            continue;
+    for (const auto &[disks, mask] : data_cases("powermgmt_disks.txt")) {
         // Each disk in the sysinfo database, and hdparm's answer for it.
         SysRoot::remove("/hdparm");
         SysRoot::mkdirs("/hdparm");
         xmldbc_del(XMLDB_SOCK_SYSINFO, 0, "/disks");
-        std::istringstream words(line.substr(0, line.find("=>")));
+        std::istringstream words(disks);
         int n = 0;
         for (std::string name, state; words >> name >> state;) {
             const std::string at = "/disks/disk:" + std::to_string(++n) + "/name";
             ASSERT_EQ(xmldbc_set(XMLDB_SOCK_SYSINFO, 0, at.c_str(), name.c_str()), 0);
             if (state != "-")
-                std::ofstream(SysRoot::file("/hdparm/") + name) << state;
+                SysRoot::write("/hdparm/" + name, state);
         }
         ASSERT_EQ(xmldbc_set(XMLDB_SOCK_SYSINFO, 0, "/disks/disk#", std::to_string(n).c_str()), 0);
         int status = -1;
         EXPECT_EQ(korv_test::run_shell(KORV_POWERMGMT_PATH " -s 2>/dev/null", &status),
-                  "result: " + line.substr(line.find("=>") + 3) + "\n") << line;
+                  "result: " + mask + "\n") << disks;
         EXPECT_EQ(status, 0);
     }
     EXPECT_FALSE(std::filesystem::exists("canary"));
