@@ -10,7 +10,7 @@
 
 #include <gtest/gtest.h>
 
-#include "tests/support/capture.h"
+#include "tests/support/process.h"
 
 using korv_test::capture_stdout;
 

@@ -12,7 +12,7 @@
 #include <gtest/gtest.h>
 
 #include "common/korvadm_err.h"
-#include "tests/support/capture.h"
+#include "tests/support/process.h"
 
 namespace {
 

@@ -12,7 +12,7 @@
 #include "common/korvadm_err.h"
 #include "common/korvadm_sys.h"
 #include "platform/xmldbc.h"
-#include "tests/support/capture.h"
+#include "tests/support/process.h"
 #include "tests/support/xmldbd_fixture.h"
 
 using korv_test::quiet;

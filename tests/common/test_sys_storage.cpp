@@ -17,7 +17,7 @@
 #include "common/korvadm_sys_internal.h"
 #include "platform/xmldbc.h"
 #include "tests/support/data_cases.h"
-#include "tests/support/capture.h"
+#include "tests/support/process.h"
 #include "tests/support/sysroot.h"
 #include "tests/support/xmldbd_fixture.h"
 

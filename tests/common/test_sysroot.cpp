@@ -10,7 +10,7 @@
 #include <gtest/gtest.h>
 
 #include "tests/support/data_cases.h"
-#include "tests/support/capture.h"
+#include "tests/support/process.h"
 
 TEST(SysrootTest, MapsUnderTheRootWhenSetAndOnlyThen)
 {

@@ -21,7 +21,7 @@
 #include "config/korvadm_xmldb_conf.h"
 #include "config/korvadm_xmldb_conf_internal.h"
 #include "platform/xmldbc.h"
-#include "tests/support/capture.h"
+#include "tests/support/process.h"
 #include "tests/support/xmldbd_fixture.h"
 
 namespace korv_test {

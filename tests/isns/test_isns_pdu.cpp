@@ -7,7 +7,7 @@
 #include <map>
 
 #include "tests/isns/isns_test_util.h"
-#include "tests/support/capture.h"
+#include "tests/support/process.h"
 
 using namespace isns_test;
 

@@ -11,7 +11,7 @@
 
 #include "common/korvadm_log.h"
 #include "tests/isns/isns_test_util.h"
-#include "tests/support/capture.h"
+#include "tests/support/process.h"
 
 using namespace isns_test;
 

@@ -17,7 +17,7 @@
 #include <unistd.h>
 
 #include "tests/isns/isns_test_util.h"
-#include "tests/support/capture.h"
+#include "tests/support/process.h"
 
 namespace {
 

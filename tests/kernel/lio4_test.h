@@ -20,7 +20,7 @@
 #include "common/korvadm_err.h"
 #include "kernel/korvadm_mod_lio4_internal.h"
 #include "kernel/korvadm_sess.h"
-#include "tests/support/capture.h"
+#include "tests/support/process.h"
 #include "tests/support/sysroot.h"
 
 namespace korv_test {

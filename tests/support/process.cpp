@@ -90,4 +90,10 @@ std::string run_shell(const std::string &cmd, int *status)
     return out;
 }
 
+int run_in_child(const std::function<int()> &fn)
+{
+    child_process child;
+    return child.start(fn) ? child.wait(1h) : -1;
+}
+
 }  // namespace korv_test

@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 // Processes a test starts (services, servers, the daemon): they never outlive
 // the test, and every wait is bounded, so a hung child cannot hang the suite.
+// And what a piece of code prints.
 #pragma once
 
 #include <sys/types.h>
@@ -10,6 +11,8 @@
 #include <string>
 #include <thread>
 #include <vector>
+
+#include <gtest/gtest.h>
 
 namespace korv_test {
 
@@ -57,5 +60,38 @@ private:
 // Runs cmd through the shell; returns its standard output (each line ended by
 // '\n') and stores its exit status in *status when asked for.
 std::string run_shell(const std::string &cmd, int *status = nullptr);
+
+// Runs fn in a forked child and returns its exit status (or 128+signal).
+// Use it for code that reads process-wide state once (the system root).
+int run_in_child(const std::function<int()> &fn);
+
+// Everything fn writes to standard output (error), printf, iostreams and
+// write(2) alike: GoogleTest flushes the streams and redirects the descriptor.
+template <class Fn>
+std::string capture_stdout(Fn fn)
+{
+    testing::internal::CaptureStdout();
+    fn();
+    return testing::internal::GetCapturedStdout();
+}
+template <class Fn>
+std::string capture_stderr(Fn fn)
+{
+    testing::internal::CaptureStderr();
+    fn();
+    return testing::internal::GetCapturedStderr();
+}
+
+// fn()'s result, with the log lines it prints kept out of the test's output
+// (and handed back in *out when asked for).
+template <class Fn>
+auto quiet(Fn fn, std::string *out = nullptr)
+{
+    decltype(fn()) result{};
+    std::string text = capture_stdout([&] { result = fn(); });
+    if (out)
+        *out = std::move(text);
+    return result;
+}
 
 }  // namespace korv_test
