@@ -2,6 +2,7 @@
 // Portal directory names: parsing, and wanted portals whose names would
 // leave the np directory. The kernel's list is read in test_mod.cpp.
 #include "tests/kernel/lio4_test.h"
+#include "tests/support/data_cases.h"
 
 namespace {
 
@@ -11,27 +12,11 @@ using korv_test::Lio4Test;
 TEST_F(Lio4Test, PortalNamesParse)
 {
     char addr[40], iface[16];
-    struct {
-        const char *name;
-        int rc;
-        const char *addr = "", *iface = "";
-        int port = 0;
-    } cases[] = {
-        {"10.0.0.1:3260", 0, "10.0.0.1", "", 3260},
-        {"[2001:db8::1]:65535", 0, "2001:db8::1", "", 65535},
-        {"10.0.0.1:", 0, "10.0.0.1", "", 0},
-        {"10.0.0.1:326000", ERR_PARAM},  // a six-character port
-        {"", ERR_ATTR_EMPTY},
-        {"[fe80::1%eeeeeeeeeeeeeeee]:3260", ERR_PARAM},                     // over-long interface
-    };
-    for (auto &c : cases) {
+    for (const auto &[name, want] : data_cases("portal_names.txt")) {
         int port = -1;
-        ASSERT_EQ(_parse_lio_np_entry(addr, sizeof addr, &port, iface, sizeof iface, c.name), c.rc) << c.name;
-        if (c.rc == 0) {
-            EXPECT_STREQ(addr, c.addr);
-            EXPECT_STREQ(iface, c.iface);
-            EXPECT_EQ(port, c.port);
-        }
+        const int rc = _parse_lio_np_entry(addr, sizeof addr, &port, iface, sizeof iface, name.c_str());
+        const std::string got = rc ? std::to_string(rc) : "0 " + std::string(addr) + " " + (*iface ? iface : "-");
+        EXPECT_EQ(got + (rc ? "" : " " + std::to_string(port)), want) << name;
     }
 }
 
