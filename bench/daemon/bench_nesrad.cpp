@@ -42,6 +42,7 @@
 #include <cstdlib>
 #include <cstring>
 #include <fstream>
+#include <initializer_list>
 #include <string>
 #include <thread>
 #include <vector>
@@ -469,26 +470,26 @@ int main(int argc, char **argv)
 
     std::string adm_conf;
     child isnsd = start_isnsd(kServer, "isns", &adm_conf);
-    if (trace_run) {
-        int rc = trace_mode(adm_conf, argv[2]);
-        kill(isnsd.pid, SIGTERM);
-        reap(isnsd);
-        kill(xmldbd, SIGTERM);
-        waitpid(xmldbd, nullptr, 0);
-        std::system(("rm -rf '" + g_root + "'").c_str());
-        return rc;
-    }
-    if (memory_run) {
-        std::string bare_adm;
-        child bare_isnsd = start_isnsd(kBareServer, "isns-bare", &bare_adm);
-        int rc = memory_mode(adm_conf, bare_adm);
-        for (const child &c : {isnsd, bare_isnsd}) {
+    // The servers stopped and the root removed, whichever mode ran.
+    auto tear_down = [&](std::initializer_list<child> servers) {
+        for (const child &c : servers) {
             kill(c.pid, SIGTERM);
             reap(c);
         }
         kill(xmldbd, SIGTERM);
         waitpid(xmldbd, nullptr, 0);
         std::system(("rm -rf '" + g_root + "'").c_str());
+    };
+    if (trace_run) {
+        int rc = trace_mode(adm_conf, argv[2]);
+        tear_down({isnsd});
+        return rc;
+    }
+    if (memory_run) {
+        std::string bare_adm;
+        child bare_isnsd = start_isnsd(kBareServer, "isns-bare", &bare_adm);
+        int rc = memory_mode(adm_conf, bare_adm);
+        tear_down({isnsd, bare_isnsd});
         return rc;
     }
 
@@ -532,11 +533,7 @@ int main(int argc, char **argv)
     long hwm = 0;
     outcome v = run_daemon(adm_conf, true, &held, &hwm);
 
-    kill(isnsd.pid, SIGTERM);
-    reap(isnsd);
-    kill(xmldbd, SIGTERM);
-    waitpid(xmldbd, nullptr, 0);
-    std::system(("rm -rf '" + g_root + "'").c_str());
+    tear_down({isnsd});
 
     double goal = 1.5 * median(floor_ms) + median(conf_ms);
     std::printf("runs: %d, %d targets, 2 portals each, in-memory isnsd on %s\n", runs, kTargets, kServer);
